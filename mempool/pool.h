@@ -1,0 +1,69 @@
+// Shared conventions of every container family: offset conversion, pool
+// calls made through a handle, handle allocation and release, value drop.
+#ifndef COFFER_MEMPOOL_POOL_H
+#define COFFER_MEMPOOL_POOL_H
+
+#include <coffer/mempool.h>
+#include <coffer/platform.h>
+
+#include <cstring>
+
+namespace coffer {
+
+// The only place where a PoolOffset turns into an address and back. 0 is null
+// both ways; nothing a pool hands out sits at its own base.
+inline void *OffsetToAddr(const MemPool *mp, PoolOffset off) {
+  return off ? static_cast<char *>(mp->base) + off : nullptr;
+}
+inline PoolOffset AddrToOffset(const MemPool *mp, const void *p) {
+  return p ? static_cast<PoolOffset>(reinterpret_cast<uintptr_t>(p) -
+                                     reinterpret_cast<uintptr_t>(mp->base))
+           : 0;
+}
+
+// Typed view of an offset in a container's pool.
+template <class T>
+inline T *At(const CollectionHeader *h, PoolOffset off) {
+  return static_cast<T *>(OffsetToAddr(&h->mp, off));
+}
+inline PoolOffset Off(const CollectionHeader *h, const void *p) { return AddrToOffset(&h->mp, p); }
+
+// Every allocation of a container goes through its handle's pool copy, with
+// the handle itself as the pool argument.
+inline void *PoolAlloc(CollectionHeader *h, size_t size) { return h->mp.alloc(&h->mp, size); }
+inline void *PoolCalloc(CollectionHeader *h, size_t size) { return h->mp.calloc(&h->mp, 1, size); }
+inline void *PoolRealloc(CollectionHeader *h, void *p, size_t size) {
+  return h->mp.realloc(&h->mp, p, size);
+}
+inline void PoolFree(CollectionHeader *h, void *p) { h->mp.free(&h->mp, p); }
+
+// Copies a NUL-terminated string into exactly strlen + 1 bytes of the pool;
+// null when the pool refuses.
+char *PoolStrdup(CollectionHeader *h, const char *s);
+
+// Allocates a zeroed handle from pool and copies the pool record into it:
+// no callbacks, ownsHandle set, no data yet. Null when the pool refuses.
+CollectionHeader *AllocHandle(MemPool *pool);
+
+// Releases the handle through its own pool when the family made it.
+void ReleaseHandle(CollectionHeader *h);
+
+// Gives a dropped value to whichever release callback is set.
+void DropValue(CollectionHeader *h, CofferVal val);
+
+FreeValFn SetFreeValFn(CollectionHeader *h, FreeValFn fn);
+MpFreeValFn SetMpFreeValFn(CollectionHeader *h, MpFreeValFn fn);
+
+// A handle built on the stack around a data record kept inside another
+// container: the outer pool, no callbacks, not owned.
+inline CollectionHeader TransientHandle(const CollectionHeader *outer, void *data) {
+  CollectionHeader t;
+  std::memset(&t, 0, sizeof t);
+  t.mp = outer->mp;
+  t.data = data;
+  return t;
+}
+
+}  // namespace coffer
+
+#endif

@@ -1,0 +1,44 @@
+// The process-heap pool: the standard allocator, with exhaustion fatal.
+#include <cstdlib>
+#include <cstring>
+
+#include "mempool/pool.h"
+
+namespace {
+
+constexpr const char *kOutOfMemory = "Out of memory trying to allocate %zu bytes.";
+
+void *MemPoolStdHeapAlloc(MemPool *, size_t size) {
+  void *p = std::malloc(size);
+  if (!p) Panic(kOutOfMemory, size);
+  return p;
+}
+
+void *MemPoolStdHeapCalloc(MemPool *, size_t count, size_t size) {
+  // Refuse a product that does not fit in 32 bits, so the report below can
+  // show the exact size that was asked for.
+  if (size != 0 && count > static_cast<size_t>(0xFFFFFFFFu) / size)
+    Panic("%s: integer overflow (%zu, %zu", "MemPoolStdHeapCalloc", count, size);
+  void *p = std::calloc(count, size);
+  if (!p) Panic(kOutOfMemory, count * size);
+  return p;
+}
+
+void *MemPoolStdHeapRealloc(MemPool *, void *ptr, size_t size) {
+  void *p = std::realloc(ptr, size);
+  if (!p && size != 0) Panic(kOutOfMemory, size);
+  return p;
+}
+
+void MemPoolStdHeapFree(MemPool *, void *ptr) { std::free(ptr); }
+
+}  // namespace
+
+extern "C" COFFER_API bool MemPool_InitOnStdHeap(MemPool *pool) {
+  std::memset(pool, 0, sizeof *pool);
+  pool->alloc = MemPoolStdHeapAlloc;
+  pool->calloc = MemPoolStdHeapCalloc;
+  pool->realloc = MemPoolStdHeapRealloc;
+  pool->free = MemPoolStdHeapFree;
+  return true;
+}
