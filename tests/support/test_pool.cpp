@@ -103,3 +103,8 @@ void RecordMpRelease(MemPool *pool, CofferVal val) {
 }
 
 }  // namespace coffer_test
+
+// Out-of-memory paths are tested by asking for sizes no heap can give; under
+// AddressSanitizer the allocator must then return null as libc's does
+// instead of reporting the request.
+extern "C" const char *__asan_default_options() { return "allocator_may_return_null=1"; }

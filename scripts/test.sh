@@ -1,0 +1,17 @@
+#!/usr/bin/env bash
+# Installs what is missing, builds coffer and runs the whole test suite twice:
+# optimised, then under AddressSanitizer and UndefinedBehaviorSanitizer.
+set -euo pipefail
+cd "$(dirname "$0")/.."
+scripts/setup.sh
+jobs=$(nproc)
+run() {
+  local dir=$1
+  shift
+  echo "== $dir"
+  cmake -S . -B "$dir" "$@" >/dev/null
+  cmake --build "$dir" -j"$jobs" >/dev/null
+  ctest --test-dir "$dir" --output-on-failure -j"$jobs"
+}
+run build-release -DCMAKE_BUILD_TYPE=Release
+run build-sanitize -DCMAKE_BUILD_TYPE=Debug -DCOFFER_SANITIZE=ON
