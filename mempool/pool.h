@@ -12,8 +12,9 @@ namespace coffer {
 
 // The only place where a PoolOffset turns into an address and back. 0 is null
 // both ways; nothing a pool hands out sits at its own base.
+// The sums wrap in 32 bits, so they are formed on integers, not pointers.
 inline void *OffsetToAddr(const MemPool *mp, PoolOffset off) {
-  return off ? static_cast<char *>(mp->base) + off : nullptr;
+  return off ? reinterpret_cast<void *>(reinterpret_cast<uintptr_t>(mp->base) + off) : nullptr;
 }
 inline PoolOffset AddrToOffset(const MemPool *mp, const void *p) {
   return p ? static_cast<PoolOffset>(reinterpret_cast<uintptr_t>(p) -
