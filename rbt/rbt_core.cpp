@@ -1,0 +1,323 @@
+// Red-black balancing on a tree with a sentinel, shared by every key family:
+// neighbour walks, rotations, insertion fix-up, removal with successor
+// relinking, and the key-independent parts of the lifecycle.
+#include <cstddef>
+
+#include "rbt/rbt_internal.h"
+
+static_assert(sizeof(RbtTreeData) == 16, "RbtTreeData is 16 bytes");
+static_assert(offsetof(RbtTreeData, root) == 0 && offsetof(RbtTreeData, nil) == 4 &&
+                  offsetof(RbtTreeData, ownsNil) == 8 && offsetof(RbtTreeData, size) == 12,
+              "RbtTreeData layout");
+static_assert(sizeof(RbtTreeData::ownsNil) == 4 && sizeof(RbtTreeData::size) == 4,
+              "ownsNil and size are 32-bit");
+static_assert(sizeof(RbtNode) == 24, "RbtNode is 24 bytes");
+static_assert(offsetof(RbtNode, parent) == 0 && offsetof(RbtNode, left) == 4 &&
+                  offsetof(RbtNode, right) == 8 && offsetof(RbtNode, key) == 12 &&
+                  offsetof(RbtNode, color) == 16 && offsetof(RbtNode, ownsNode) == 17 &&
+                  offsetof(RbtNode, reserved) == 18 && offsetof(RbtNode, val) == 20,
+              "RbtNode layout");
+static_assert(sizeof(RbtNode::key) == 4 && sizeof(RbtNode::val) == 4 &&
+                  sizeof(RbtNode::color) == 1 && sizeof(RbtNode::ownsNode) == 1,
+              "RbtNode field widths");
+
+namespace coffer {
+
+RbtNode *RBTSuccessor(const RbtCtx &c, const RbtNode *x) {
+  if (x->right != c.nilOff) {
+    RbtNode *y = c.N(x->right);
+    while (y->left != c.nilOff) y = c.N(y->left);
+    return y;
+  }
+  // Climb while we come from a right child; compare offsets, not addresses.
+  PoolOffset xo = c.O(x);
+  for (PoolOffset yo = x->parent; yo != c.nilOff;) {
+    RbtNode *y = c.N(yo);
+    if (y->right != xo) return y;
+    xo = yo;
+    yo = y->parent;
+  }
+  return c.nil;
+}
+
+RbtNode *RBTPredecessor(const RbtCtx &c, const RbtNode *x) {
+  if (x->left != c.nilOff) {
+    RbtNode *y = c.N(x->left);
+    while (y->right != c.nilOff) y = c.N(y->right);
+    return y;
+  }
+  PoolOffset xo = c.O(x);
+  for (PoolOffset yo = x->parent; yo != c.nilOff;) {
+    RbtNode *y = c.N(yo);
+    if (y->left != xo) return y;
+    xo = yo;
+    yo = y->parent;
+  }
+  return c.nil;
+}
+
+RbtNode *RBTMinimum(const RbtCtx &c) {
+  PoolOffset xo = c.d->root;
+  if (xo == c.nilOff) return c.nil;
+  RbtNode *x = c.N(xo);
+  while (x->left != c.nilOff) x = c.N(x->left);
+  return x;
+}
+
+RbtNode *RBTMaximum(const RbtCtx &c) {
+  PoolOffset xo = c.d->root;
+  if (xo == c.nilOff) return c.nil;
+  RbtNode *x = c.N(xo);
+  while (x->right != c.nilOff) x = c.N(x->right);
+  return x;
+}
+
+namespace {
+
+// Points whatever linked to old (its parent's child link, or root) at repl.
+inline void ReplaceChild(const RbtCtx &c, PoolOffset parent, PoolOffset old, PoolOffset repl) {
+  if (parent == c.nilOff) {
+    c.d->root = repl;
+    return;
+  }
+  RbtNode *p = c.N(parent);
+  if (p->left == old)
+    p->left = repl;
+  else
+    p->right = repl;
+}
+
+inline uint8_t ColorOf(const RbtCtx &c, PoolOffset off) { return c.N(off)->color; }
+
+}  // namespace
+
+// Neither rotation writes the sentinel: a shared sentinel stays untouched.
+void RBTRotateLeft(const RbtCtx &c, RbtNode *x) {
+  PoolOffset xo = c.O(x), yo = x->right;
+  RbtNode *y = c.N(yo);
+  x->right = y->left;
+  if (y->left != c.nilOff) c.N(y->left)->parent = xo;
+  y->parent = x->parent;
+  ReplaceChild(c, x->parent, xo, yo);
+  y->left = xo;
+  x->parent = yo;
+}
+
+void RBTRotateRight(const RbtCtx &c, RbtNode *x) {
+  PoolOffset xo = c.O(x), yo = x->left;
+  RbtNode *y = c.N(yo);
+  x->left = y->right;
+  if (y->right != c.nilOff) c.N(y->right)->parent = xo;
+  y->parent = x->parent;
+  ReplaceChild(c, x->parent, xo, yo);
+  y->right = xo;
+  x->parent = yo;
+}
+
+namespace {
+
+void InsertFixup(const RbtCtx &c, RbtNode *z) {
+  for (;;) {
+    PoolOffset po = z->parent;
+    RbtNode *p = c.N(po);  // the sentinel (black) above the root ends the loop
+    if (p->color != kRbtRed) break;
+    RbtNode *g = c.N(p->parent);  // exists: a red parent is never the root
+    if (g->left == po) {
+      RbtNode *u = c.N(g->right);
+      if (u->color == kRbtRed) {
+        p->color = kRbtBlack;
+        u->color = kRbtBlack;
+        g->color = kRbtRed;
+        z = g;
+        continue;
+      }
+      if (p->right == c.O(z)) {
+        z = p;
+        RBTRotateLeft(c, z);
+        p = c.N(z->parent);
+      }
+      p->color = kRbtBlack;
+      g->color = kRbtRed;
+      RBTRotateRight(c, g);
+    } else {
+      RbtNode *u = c.N(g->left);
+      if (u->color == kRbtRed) {
+        p->color = kRbtBlack;
+        u->color = kRbtBlack;
+        g->color = kRbtRed;
+        z = g;
+        continue;
+      }
+      if (p->left == c.O(z)) {
+        z = p;
+        RBTRotateRight(c, z);
+        p = c.N(z->parent);
+      }
+      p->color = kRbtBlack;
+      g->color = kRbtRed;
+      RBTRotateLeft(c, g);
+    }
+  }
+  c.N(c.d->root)->color = kRbtBlack;
+}
+
+// x may be the sentinel; its parent field was set by the caller for this.
+void DeleteFixup(const RbtCtx &c, PoolOffset xo) {
+  RbtNode *x = c.N(xo);
+  while (xo != c.d->root && x->color == kRbtBlack) {
+    PoolOffset po = x->parent;
+    RbtNode *p = c.N(po);
+    if (p->left == xo) {
+      RbtNode *w = c.N(p->right);
+      if (w->color == kRbtRed) {
+        w->color = kRbtBlack;
+        p->color = kRbtRed;
+        RBTRotateLeft(c, p);
+        w = c.N(p->right);
+      }
+      if (ColorOf(c, w->left) == kRbtBlack && ColorOf(c, w->right) == kRbtBlack) {
+        w->color = kRbtRed;
+        xo = po;
+        x = p;
+        continue;
+      }
+      if (ColorOf(c, w->right) == kRbtBlack) {
+        c.N(w->left)->color = kRbtBlack;
+        w->color = kRbtRed;
+        RBTRotateRight(c, w);
+        w = c.N(p->right);
+      }
+      w->color = p->color;
+      p->color = kRbtBlack;
+      c.N(w->right)->color = kRbtBlack;
+      RBTRotateLeft(c, p);
+    } else {
+      RbtNode *w = c.N(p->left);
+      if (w->color == kRbtRed) {
+        w->color = kRbtBlack;
+        p->color = kRbtRed;
+        RBTRotateRight(c, p);
+        w = c.N(p->left);
+      }
+      if (ColorOf(c, w->left) == kRbtBlack && ColorOf(c, w->right) == kRbtBlack) {
+        w->color = kRbtRed;
+        xo = po;
+        x = p;
+        continue;
+      }
+      if (ColorOf(c, w->left) == kRbtBlack) {
+        c.N(w->right)->color = kRbtBlack;
+        w->color = kRbtRed;
+        RBTRotateLeft(c, w);
+        w = c.N(p->left);
+      }
+      w->color = p->color;
+      p->color = kRbtBlack;
+      c.N(w->left)->color = kRbtBlack;
+      RBTRotateRight(c, p);
+    }
+    xo = c.d->root;
+    x = c.N(xo);
+  }
+  // Never recolours the sentinel: it is black already, and a caller's
+  // sentinel may be shared with other trees.
+  if (x->color != kRbtBlack) x->color = kRbtBlack;
+}
+
+}  // namespace
+
+void RBTAttach(const RbtCtx &c, RbtNode *z, RbtNode *parent, bool left) {
+  PoolOffset zo = c.O(z);
+  z->parent = c.O(parent);
+  if (parent == c.nil)
+    c.d->root = zo;
+  else if (left)
+    parent->left = zo;
+  else
+    parent->right = zo;
+  InsertFixup(c, z);
+  c.d->size++;
+}
+
+void RBTUnlink(const RbtCtx &c, RbtNode *z) {
+  PoolOffset zo = c.O(z);
+  RbtNode *y = (z->left == c.nilOff || z->right == c.nilOff) ? z : RBTSuccessor(c, z);
+  PoolOffset yo = c.O(y);
+  PoolOffset xo = y->left != c.nilOff ? y->left : y->right;
+  // Also for the sentinel: the fix-up climbs from it through this field.
+  c.N(xo)->parent = y->parent;
+  ReplaceChild(c, y->parent, yo, xo);
+  if (y->color == kRbtBlack) DeleteFixup(c, xo);
+  if (y == z) return;
+  // The successor node itself takes z's place, so no key or value changes
+  // node. The fix-up ran with z standing where y now goes, which gives the
+  // same shape and colours as copying y's contents into z.
+  ReplaceChild(c, z->parent, zo, yo);
+  y->parent = z->parent;
+  y->left = z->left;
+  y->right = z->right;
+  y->color = z->color;
+  c.N(z->left)->parent = yo;
+  c.N(z->right)->parent = yo;
+}
+
+int32_t RBTCreateTreeData(RbtTree *tree, RbtNode *nil) {
+  auto *d = static_cast<RbtTreeData *>(PoolCalloc(tree, sizeof(RbtTreeData)));
+  tree->data = d;
+  if (!d) return 0;
+  uint32_t ownsNil = 0;
+  if (!nil) {
+    nil = static_cast<RbtNode *>(PoolCalloc(tree, sizeof(RbtNode)));
+    if (!nil) {
+      PoolFree(tree, d);
+      tree->data = nullptr;
+      return 0;
+    }
+    ownsNil = 1;
+  }
+  PoolOffset nilOff = Off(tree, nil);
+  d->root = d->nil = nilOff;
+  d->ownsNil = ownsNil;
+  d->size = 0;
+  // Every field but key: a caller's sentinel keeps whatever key it holds.
+  nil->parent = nil->left = nil->right = nilOff;
+  nil->color = kRbtBlack;
+  nil->ownsNode = 1;
+  nil->val = 0;
+  return 1;
+}
+
+RbtTree *RBTAllocTree(MemPool *pool, RbtNode *nil) {
+  RbtTree *tree = AllocHandle(pool);
+  if (!tree) return nullptr;
+  if (!RBTCreateTreeData(tree, nil)) {
+    ReleaseHandle(tree);
+    return nullptr;
+  }
+  return tree;
+}
+
+RbtTree *RBTAllocTreeOnStdHeap() {
+  MemPool pool;
+  MemPool_InitOnStdHeap(&pool);
+  return RBTAllocTree(&pool, nullptr);
+}
+
+// ownsNil travels with nil, so each flag keeps describing the sentinel it
+// was set for and a free never releases a caller's sentinel nor leaks the
+// tree's own.
+void RBTSwap(RbtTree *tree, RbtTree *other) {
+  auto *a = static_cast<RbtTreeData *>(tree->data);
+  auto *b = static_cast<RbtTreeData *>(other->data);
+  RbtTreeData tmp = *a;
+  a->root = b->root;
+  a->nil = b->nil;
+  a->ownsNil = b->ownsNil;
+  a->size = b->size;
+  b->root = tmp.root;
+  b->nil = tmp.nil;
+  b->ownsNil = tmp.ownsNil;
+  b->size = tmp.size;
+}
+
+}  // namespace coffer

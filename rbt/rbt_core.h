@@ -1,0 +1,252 @@
+// The key-dependent procedures of the red-black trees, written once over a
+// key policy. A policy K provides:
+//
+//   using Arg                      the key as callers pass it
+//   static bool Acquire(tree, key, uint32_t *word)
+//                                  makes the node's key word (the string
+//                                  family copies the key into the pool);
+//                                  false when it cannot
+//   static void Release(tree, word) gives back what Acquire made
+//   struct Probe                   one descent's comparator: Probe(tree, key),
+//                                  Compare(node) < 0, 0, > 0 as the key comes
+//                                  before, equals or follows the node's key,
+//                                  WentLeft()/WentRight() after each step (the
+//                                  string family keeps its common prefixes
+//                                  there), Equal(node) for the equal-run walks
+//
+// Every instance is a hidden function of its family; the exported calls are
+// thin wrappers around them (COFFER_RBT_DEFINE_FAMILY below).
+#ifndef COFFER_RBT_CORE_H
+#define COFFER_RBT_CORE_H
+
+#include "rbt/rbt_internal.h"
+
+namespace coffer {
+namespace rbt {
+
+template <class K>
+RbtNode *InsertNode(RbtTree *tree, RbtNode *node, typename K::Arg key, CofferVal val) {
+  uint32_t word;
+  if (!K::Acquire(tree, key, &word)) return nullptr;
+  uint8_t owns = 0;
+  if (!node) {
+    node = static_cast<RbtNode *>(PoolCalloc(tree, sizeof(RbtNode)));
+    if (!node) {
+      K::Release(tree, word);
+      return nullptr;
+    }
+    owns = 1;
+  }
+  RbtCtx c(tree);
+  node->parent = node->left = node->right = c.nilOff;
+  node->key = word;
+  node->color = kRbtRed;
+  node->ownsNode = owns;
+  node->val = val;
+
+  // Equal keys go right, after every node they equal: insertion order.
+  typename K::Probe probe(tree, key);
+  RbtNode *y = c.nil;
+  bool left = false;
+  for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
+    y = c.N(xo);
+    left = probe.Compare(y) < 0;
+    if (left) {
+      probe.WentLeft();
+      xo = y->left;
+    } else {
+      probe.WentRight();
+      xo = y->right;
+    }
+  }
+  // The last comparison was against y, so it also says on which side of y
+  // the node goes.
+  RBTAttach(c, node, y, left);
+  return node;
+}
+
+template <class K>
+void RemoveNode(const RbtCtx &c, RbtNode *z) {
+  // The value goes first, while z is still linked and counted.
+  DropValue(c.t, z->val);
+  RBTUnlink(c, z);
+  K::Release(c.t, z->key);
+  if (z->ownsNode) PoolFree(c.t, z);
+  c.d->size--;
+}
+
+// Removes first up to but not including end (null: to the last node), in
+// ascending order. Nodes keep their identity, so next stays valid.
+template <class K>
+void RemoveRange(RbtTree *tree, RbtNode *first, RbtNode *end) {
+  if (first == end) return;
+  RbtCtx c(tree);
+  for (;;) {
+    RbtNode *next = c.OrNull(RBTSuccessor(c, first));
+    RemoveNode<K>(c, first);
+    if (next == end) return;
+    first = next;
+  }
+}
+
+template <class K>
+void Clear(RbtTree *tree) {
+  RbtCtx c(tree);
+  if (c.d->size == 0) return;
+  RbtNode *x = RBTMinimum(c);
+  for (;;) {
+    RbtNode *next = RBTSuccessor(c, x);
+    RemoveNode<K>(c, x);
+    if (next == c.nil) return;
+    x = next;
+  }
+}
+
+template <class K>
+void FreeTree(RbtTree *tree) {
+  if (!tree) return;
+  auto *d = static_cast<RbtTreeData *>(tree->data);
+  if (d) {
+    if (d->size) Clear<K>(tree);
+    if (d->ownsNil) PoolFree(tree, At<RbtNode>(tree, d->nil));
+    tree->data = nullptr;  // a handle the caller keeps must not point at freed memory
+    PoolFree(tree, d);
+  }
+  ReleaseHandle(tree);
+}
+
+// The first equal node on the path from the root.
+template <class K>
+RbtNode *Find(RbtTree *tree, typename K::Arg key) {
+  RbtCtx c(tree);
+  typename K::Probe probe(tree, key);
+  for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
+    RbtNode *x = c.N(xo);
+    int r = probe.Compare(x);
+    if (r == 0) return x;
+    if (r < 0) {
+      probe.WentLeft();
+      xo = x->left;
+    } else {
+      probe.WentRight();
+      xo = x->right;
+    }
+  }
+  return nullptr;
+}
+
+// The descent shared by both bounds: returns the bound directly when the key
+// is absent, or the first equal node met (with *equal set).
+template <class K>
+RbtNode *BoundDescent(const RbtCtx &c, typename K::Probe &probe, bool *equal) {
+  *equal = false;
+  PoolOffset xo = c.d->root;
+  if (xo == c.nilOff) return nullptr;
+  for (;;) {
+    RbtNode *x = c.N(xo);
+    int r = probe.Compare(x);
+    if (r < 0) {
+      if (x->left == c.nilOff) return x;
+      probe.WentLeft();
+      xo = x->left;
+    } else if (r > 0) {
+      if (x->right == c.nilOff) return c.OrNull(RBTSuccessor(c, x));
+      probe.WentRight();
+      xo = x->right;
+    } else {
+      *equal = true;
+      return x;
+    }
+  }
+}
+
+template <class K>
+RbtNode *LowerBound(RbtTree *tree, typename K::Arg key) {
+  RbtCtx c(tree);
+  typename K::Probe probe(tree, key);
+  bool equal;
+  RbtNode *x = BoundDescent<K>(c, probe, &equal);
+  if (!equal) return x;
+  for (RbtNode *p = RBTPredecessor(c, x); p != c.nil && probe.Equal(p); p = RBTPredecessor(c, p))
+    x = p;
+  return x;
+}
+
+template <class K>
+RbtNode *UpperBound(RbtTree *tree, typename K::Arg key) {
+  RbtCtx c(tree);
+  typename K::Probe probe(tree, key);
+  bool equal;
+  RbtNode *x = BoundDescent<K>(c, probe, &equal);
+  if (!equal) return x;
+  do x = RBTSuccessor(c, x);
+  while (x != c.nil && probe.Equal(x));
+  return c.OrNull(x);
+}
+
+// Key-independent calls, shared by the wrappers of every family.
+inline RbtNode *First(RbtTree *tree) {
+  RbtCtx c(tree);
+  return c.d->size ? RBTMinimum(c) : nullptr;
+}
+inline RbtNode *Next(RbtTree *tree, RbtNode *node) {
+  RbtCtx c(tree);
+  return c.OrNull(RBTSuccessor(c, node));
+}
+inline RbtNode *Prev(RbtTree *tree, RbtNode *node) {
+  RbtCtx c(tree);
+  return c.OrNull(node ? RBTPredecessor(c, node) : RBTMaximum(c));
+}
+inline int32_t GetSize(RbtTree *tree) {
+  return static_cast<int32_t>(static_cast<RbtTreeData *>(tree->data)->size);
+}
+
+}  // namespace rbt
+}  // namespace coffer
+
+// The twenty exported calls of one family P over key policy K (KeyT is the
+// key type of P's declarations in coffer/rbt.h), whose insertion and removal
+// are the family's internal INSERT and REMOVE.
+#define COFFER_RBT_DEFINE_FAMILY(P, K, KeyT, INSERT, REMOVE)                                     \
+  extern "C" {                                                                                   \
+  RbtTree *P##_AllocTree(void) { return coffer::RBTAllocTreeOnStdHeap(); }                       \
+  RbtTree *P##_AllocTreeEx(MemPool *pool) { return coffer::RBTAllocTree(pool, nullptr); }        \
+  RbtTree *P##_AllocTreeWithNil(MemPool *pool, RbtNode *nil) {                                   \
+    return coffer::RBTAllocTree(pool, nil);                                                      \
+  }                                                                                              \
+  int32_t P##_CreateTreeData(RbtTree *tree, RbtNode *nil) {                                      \
+    return coffer::RBTCreateTreeData(tree, nil);                                                 \
+  }                                                                                              \
+  void P##_FreeTree(RbtTree *tree) { coffer::rbt::FreeTree<K>(tree); }                           \
+  void P##_Clear(RbtTree *tree) { coffer::rbt::Clear<K>(tree); }                                 \
+  int32_t P##_GetSize(RbtTree *tree) { return coffer::rbt::GetSize(tree); }                      \
+  FreeValFn P##_SetFreeValFn(RbtTree *tree, FreeValFn fn) {                                      \
+    return coffer::SetFreeValFn(tree, fn);                                                       \
+  }                                                                                              \
+  MpFreeValFn P##_SetMpFreeValFn(RbtTree *tree, MpFreeValFn fn) {                                \
+    return coffer::SetMpFreeValFn(tree, fn);                                                     \
+  }                                                                                              \
+  void P##_Swap(RbtTree *tree, RbtTree *other) { coffer::RBTSwap(tree, other); }                 \
+  RbtNode *P##_Insert(RbtTree *tree, KeyT key, CofferVal val) {                                  \
+    return coffer::INSERT(tree, nullptr, key, val);                                              \
+  }                                                                                              \
+  RbtNode *P##_InsertNoAlloc(RbtTree *tree, RbtNode *node, KeyT key, CofferVal val) {            \
+    return coffer::INSERT(tree, node, key, val);                                                 \
+  }                                                                                              \
+  void P##_Remove(RbtTree *tree, RbtNode *node) { coffer::REMOVE(tree, node); }                  \
+  void P##_RemoveRange(RbtTree *tree, RbtNode *first, RbtNode *end) {                            \
+    coffer::rbt::RemoveRange<K>(tree, first, end);                                               \
+  }                                                                                              \
+  RbtNode *P##_Find(RbtTree *tree, KeyT key) { return coffer::rbt::Find<K>(tree, key); }         \
+  RbtNode *P##_LowerBound(RbtTree *tree, KeyT key) {                                             \
+    return coffer::rbt::LowerBound<K>(tree, key);                                                \
+  }                                                                                              \
+  RbtNode *P##_UpperBound(RbtTree *tree, KeyT key) {                                             \
+    return coffer::rbt::UpperBound<K>(tree, key);                                                \
+  }                                                                                              \
+  RbtNode *P##_First(RbtTree *tree) { return coffer::rbt::First(tree); }                         \
+  RbtNode *P##_Next(RbtTree *tree, RbtNode *node) { return coffer::rbt::Next(tree, node); }      \
+  RbtNode *P##_Prev(RbtTree *tree, RbtNode *node) { return coffer::rbt::Prev(tree, node); }      \
+  }
+
+#endif
