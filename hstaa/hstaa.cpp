@@ -1,0 +1,271 @@
+// Associative arrays over the string tree: path-keyed values, a value count
+// per subtree, and array templates. Under any node, a child named "#" or "##"
+// is the template (representative) of the array whose elements are the
+// siblings keyed "#x..." or "##x..."; an element missing from the tree reads
+// as its template, is made as a copy of it, and receives whatever is inserted
+// or removed through the template while it exists.
+//
+// Paths are walked in place: each component is cut by overwriting the
+// separator behind it with NUL, and every walk that changes the tree puts the
+// separator back before it returns, so one remainder can be handed to several
+// elements in turn and then walked by the caller itself.
+#include <coffer/hstaa.h>
+
+#include <cstddef>
+#include <cstdlib>
+#include <cstring>
+
+#include "mempool/pool.h"
+
+static_assert(offsetof(HstaaTree, hst) == 0, "an HstaaTree is also an HstTree and a MemPool");
+static_assert(offsetof(HstaaTree, cloneValFn) == sizeof(HstTree) &&
+                  offsetof(HstaaTree, insertValFn) == sizeof(HstTree) + 4 &&
+                  offsetof(HstaaTree, removeValFn) == sizeof(HstTree) + 8,
+              "HstaaTree member order");
+static_assert(offsetof(HstNode, subtreeValCount) == 16 && sizeof(HstNode) == 20,
+              "the value count is the fifth word of a node");
+
+namespace {
+
+// The two marks. Callers may compare the pointers: there is one of each.
+const char kMark[] = "#";
+const char kDoubleMark[] = "##";
+
+HstTreeData *Data(HstaaTree *tree) { return static_cast<HstTreeData *>(tree->hst.data); }
+char Separator(HstaaTree *tree) { return Data(tree)->separator; }
+
+// The one place where this layer turns pool offsets into records: a child
+// array entry holds its node's offset, a node holds its child array's.
+HstNode *NodeAt(HstaaTree *tree, CofferVal off) {
+  return coffer::At<HstNode>(&tree->hst, static_cast<PoolOffset>(off));
+}
+EsaArrayData *ChildArray(HstaaTree *tree, HstNode *node) {
+  return coffer::At<EsaArrayData>(&tree->hst, node->children);
+}
+
+// The template that an element key falls back on, if node has one.
+HstNode *FindRep(HstaaTree *tree, HstNode *node, const char *key) {
+  const char *mark = HSTAA_GetArrayRep(key);
+  return mark ? HST_FindChild(&tree->hst, node, mark) : nullptr;
+}
+
+// The separator behind the component that starts at text, or null when the
+// component runs to the end. A NUL separator would match the terminator and
+// lead the walk past it, so it never cuts.
+char *FindCut(char *text, char sep) { return sep ? std::strchr(text, sep) : nullptr; }
+
+char *CopyPath(const char *path) {
+  size_t n = std::strlen(path) + 1;
+  char *copy = static_cast<char *>(std::malloc(n));
+  if (copy) std::strncpy(copy, path, n);
+  return copy;
+}
+
+// Finds the child named key, or makes it: as a copy of its array's template
+// when there is one (the copied values then count in node and above), else
+// as a plain node without values. *plain tells which way it was made.
+HstNode *InsertStep(HstaaTree *tree, HstNode *node, const char *key, bool *plain) {
+  HstTree *h = &tree->hst;
+  *plain = false;
+  if (HstNode *child = HST_FindChild(h, node, key)) return child;
+  if (HstNode *rep = FindRep(tree, node, key)) {
+    HstNode *copy = HST_CloneSubtree(h, rep, tree->cloneValFn, key, node);
+    if (copy) HSTAAAdjustSubtreeValCount(h, node, copy->subtreeValCount);
+    return copy;
+  }
+  HstNode *child = HST_InsertChild(h, node, key, Data(tree)->defaultVal);
+  *plain = child != nullptr;
+  return child;
+}
+
+// After a removal below child (named key, under node): drops child when it
+// holds nothing, or when it is an element that holds just as many values as
+// its template and so adds nothing a lookup through the template would not
+// find.
+void PruneAfterRemoval(HstaaTree *tree, HstNode *node, HstNode *child, const char *key) {
+  int32_t n = child->subtreeValCount;
+  bool prune = n == 0;
+  if (!prune) {
+    HstNode *rep = FindRep(tree, node, key);
+    prune = rep && rep->subtreeValCount == n;
+  }
+  if (!prune) return;
+  HST_RemoveSubtree(&tree->hst, child);
+  HSTAAAdjustSubtreeValCount(&tree->hst, node, -n);
+}
+
+}  // namespace
+
+extern "C" {
+
+int32_t HSTAA_GetSubtreeValCount(HstaaTree *, HstNode *node) { return node->subtreeValCount; }
+
+bool HSTAA_IsArrayRep(const char *key) {
+  return key[0] == '#' && (key[1] == '\0' || (key[1] == '#' && key[2] == '\0'));
+}
+
+const char *HSTAA_GetArrayRep(const char *key) {
+  if (key[0] != '#') return nullptr;
+  if (key[1] == '#') return key[2] != '\0' ? kDoubleMark : nullptr;
+  return key[1] != '\0' ? kMark : nullptr;
+}
+
+bool HSTAA_IsArrayIndex(const char *key) { return HSTAA_GetArrayRep(key) != nullptr; }
+
+HstNode *HSTAAFindPrefix(HstaaTree *tree, HstNode *node, char *path, bool *outComplete) {
+  if (!path || !*path) {
+    *outComplete = node != nullptr;
+    return node;
+  }
+  const char sep = Separator(tree);
+  for (;;) {
+    char *cut = FindCut(path, sep);
+    if (cut) *cut = '\0';
+    HstNode *child = HST_FindChild(&tree->hst, node, path);
+    if (!child) child = FindRep(tree, node, path);
+    if (!child) {
+      // The cut stays: the unresolved component is left terminated.
+      *outComplete = false;
+      return node;
+    }
+    if (cut) *cut = sep;
+    if (!cut || !cut[1]) {
+      *outComplete = true;
+      return child;
+    }
+    node = child;
+    path = cut + 1;
+  }
+}
+
+HstNode *HSTAA_FindPrefix(HstaaTree *tree, const char *path, bool *outComplete) {
+  HstNode *root = HST_GetRoot(&tree->hst);
+  if (!*path) {
+    // No leading character to skip, so nothing of the path was resolved.
+    *outComplete = false;
+    return root;
+  }
+  char *copy = CopyPath(path);
+  if (!copy) return nullptr;
+  HstNode *found = HSTAAFindPrefix(tree, root, copy + 1, outComplete);
+  std::free(copy);
+  return found;
+}
+
+HstNode *HSTAAInsert(HstaaTree *tree, HstNode *node, char *path, CofferVal val) {
+  HstTree *h = &tree->hst;
+  // The topmost node this call made as a plain path step. All nodes made
+  // after it lie below it, so removing it undoes every plain step at once.
+  HstNode *made = nullptr;
+  if (path && *path) {
+    const char sep = Separator(tree);
+    char *key = path;
+    for (;;) {
+      char *cut = FindCut(key, sep);
+      if (cut) *cut = '\0';
+      bool plain;
+      HstNode *child = InsertStep(tree, node, key, &plain);
+      if (!child) {
+        if (cut) *cut = sep;
+        return nullptr;
+      }
+      if (plain && !made) made = child;
+      // Elements take the value before their template; a refusal there does
+      // not stop the insertion into the template.
+      if (HSTAA_IsArrayRep(key))
+        HSTAAPropagateVal(tree, 0, node, child, cut ? cut + 1 : nullptr, val);
+      if (cut) *cut = sep;
+      node = child;
+      if (!cut || !cut[1]) break;
+      key = cut + 1;
+    }
+  }
+  CofferVal cur = HST_GetVal(h, node);
+  CofferVal out = cur;
+  if (tree->insertValFn(tree, cur, val, &out)) {
+    HST_SetVal(h, node, out);
+    HSTAAAdjustSubtreeValCount(h, node, 1);
+    return node;
+  }
+  // Refused: leave no empty node of this call's making behind. Values that
+  // were there before, and those carried into elements, stay.
+  if (made && made->subtreeValCount == 0) HST_RemoveSubtree(h, made);
+  return nullptr;
+}
+
+HstNode *HSTAA_Insert(HstaaTree *tree, const char *path, CofferVal val) {
+  if (!*path) return nullptr;
+  char *copy = CopyPath(path);
+  if (!copy) return nullptr;
+  HstNode *target = HSTAAInsert(tree, HST_GetRoot(&tree->hst), copy + 1, val);
+  std::free(copy);
+  return target;
+}
+
+void HSTAARemove(HstaaTree *tree, HstNode *node, char *path, CofferVal val) {
+  HstTree *h = &tree->hst;
+  if (!path || !*path) {
+    CofferVal cur = HST_GetVal(h, node);
+    CofferVal out = cur;
+    if (tree->removeValFn(tree, cur, val, &out)) {
+      HST_SetVal(h, node, out);
+      HSTAAAdjustSubtreeValCount(h, node, -1);
+    }
+    return;
+  }
+  const char sep = Separator(tree);
+  char *cut = FindCut(path, sep);
+  if (cut) *cut = '\0';
+  char *rest = cut ? cut + 1 : nullptr;
+  // A missing component ends the removal; a missing element is not looked
+  // for in its template, whose values belong to the template alone.
+  if (HstNode *child = HST_FindChild(h, node, path)) {
+    if (HSTAA_IsArrayRep(path)) HSTAAPropagateVal(tree, 1, node, child, rest, val);
+    HSTAARemove(tree, child, rest, val);
+    PruneAfterRemoval(tree, node, child, path);
+  }
+  if (cut) *cut = sep;
+}
+
+bool HSTAA_Remove(HstaaTree *tree, const char *path, CofferVal val) {
+  if (!*path) return true;  // names nothing, so there is nothing to remove
+  char *copy = CopyPath(path);
+  if (!copy) return false;
+  HSTAARemove(tree, HST_GetRoot(&tree->hst), copy + 1, val);
+  std::free(copy);
+  return true;
+}
+
+bool HSTAAPropagateVal(HstaaTree *tree, int32_t mode, HstNode *parent, HstNode *rep, char *rest,
+                       CofferVal val) {
+  HstTree *h = &tree->hst;
+  const char *mark = HST_GetKey(h, rep);
+  if (!HSTAA_IsArrayRep(mark) || !parent->children) return true;
+  // The elements of an array follow its template in key order, so only that
+  // run is visited: found by bisection, ended by the first other key.
+  EsaArray kids = coffer::TransientHandle(h, ChildArray(tree, parent));
+  int32_t i;
+  if (!ESA_Find(&kids, mark, &i)) return true;
+  ++i;
+  for (;;) {
+    HstNode *elem = NodeAt(tree, ESA_GetVal(&kids, i));
+    if (!elem) return true;
+    const char *elemMark = HSTAA_GetArrayRep(HST_GetKey(h, elem));
+    if (!elemMark || std::strcmp(elemMark, mark) != 0) return true;
+    if (mode == 0) {
+      if (!HSTAAInsert(tree, elem, rest, val)) return false;
+    } else if (mode == 1) {
+      HSTAARemove(tree, elem, rest, val);
+      if (elem->subtreeValCount == 0) {
+        // Nothing left in it: drop it, and look at the same position again,
+        // where the next element now stands. It held no values, so no
+        // count changes.
+        HST_RemoveSubtree(h, elem);
+        continue;
+      }
+    }
+    ++i;
+  }
+}
+
+}  // extern "C"
