@@ -5,4 +5,4 @@ cd "$(dirname "$0")/.."
 scripts/setup.sh
 cmake -S . -B build -DCMAKE_BUILD_TYPE=Release -DCOFFER_TESTS=OFF >/dev/null
 cmake --build build -j"$(nproc)" >/dev/null
-exec ./build/examples/esa_demo
+exec ./build/examples/shared_demo

@@ -1,0 +1,250 @@
+/* Containers shared by processes.
+ *
+ * The parent creates a shared memory object, formats it as a heap region
+ * under a process-shared lock kept in the object, and builds three
+ * containers there: an associative array with an array template, a
+ * red-black tree and a sorted string array. Worker processes then map the
+ * object at addresses of their own, attach a pool with size 0 and change the
+ * containers concurrently, each container call under a lock of the demo's
+ * own (the containers take none). Last, the parent checks every container
+ * and the heap, frees everything and checks that the region is whole again. */
+#define _GNU_SOURCE
+#include <coffer/coffer.h>
+#include <coffer/platform.h>
+
+#include <fcntl.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/mman.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+enum { WORKERS = 4, ITEMS = 250, REGION_SIZE = 4 << 20, LIMIT = 100 };
+
+/* The head of the shared object: two locks and where the containers'
+ * records are. The heap region follows it. Only offsets are kept here, since
+ * every process maps the object at its own address. */
+typedef struct Shared {
+  TandelExclLock heapLock; /* held by the pool for one allocator call */
+  TandelExclLock demoLock; /* held by the demo around each container call */
+  PoolOffset hstData, rbtData, esaData;
+} Shared;
+
+#define REGION(sh) ((void *)((char *)(sh) + sizeof(Shared)))
+
+/* Values of the associative array are counters: insertion adds the
+ * operand, removal takes it away, and copies are plain. */
+static bool AddVal(HstaaTree *t, CofferVal cur, CofferVal op, CofferVal *out) {
+  (void)t;
+  *out = cur + op;
+  return true;
+}
+static bool SubVal(HstaaTree *t, CofferVal cur, CofferVal op, CofferVal *out) {
+  (void)t;
+  if (cur < op) return false;
+  *out = cur - op;
+  return true;
+}
+static bool CopyVal(HstTree *t, CofferVal v, CofferVal *out) {
+  (void)t;
+  *out = v;
+  return true;
+}
+
+/* Process-local handles around the shared records. */
+typedef struct Handles {
+  MemPool pool;
+  HstaaTree aa;
+  RbtTree rbt;
+  EsaArray esa;
+} Handles;
+
+static void *At(MemPool *pool, PoolOffset off) { return (char *)pool->base + off; }
+static PoolOffset Off(MemPool *pool, void *p) { return (PoolOffset)((char *)p - (char *)pool->base); }
+
+static void MakeHandles(Handles *h, Shared *sh) {
+  memset(h, 0, sizeof *h);
+  MemPool_InitOnSharedHeap(&h->pool, REGION(sh), 0, &sh->heapLock); /* attach */
+  h->aa.hst.mp = h->pool;
+  h->aa.hst.data = At(&h->pool, sh->hstData);
+  h->aa.cloneValFn = CopyVal;
+  h->aa.insertValFn = AddVal;
+  h->aa.removeValFn = SubVal;
+  h->rbt.mp = h->pool;
+  h->rbt.data = At(&h->pool, sh->rbtData);
+  h->esa.mp = h->pool;
+  h->esa.data = At(&h->pool, sh->esaData);
+}
+
+static Shared *MapObject(int fd, size_t size) {
+  void *p = mmap(NULL, size, PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
+  if (p == MAP_FAILED) {
+    perror("mmap");
+    exit(1);
+  }
+  return (Shared *)p;
+}
+
+static void Worker(int fd, size_t size, Shared *inherited, int w) {
+  /* Map the object anew while the inherited mapping still occupies its
+   * range, so this process sees the region at another address. */
+  Shared *sh = MapObject(fd, size);
+  Handles h;
+  char path[64], key[32];
+  int i;
+  munmap(inherited, size);
+  MakeHandles(&h, sh);
+  printf("worker %d: region mapped at %p\n", w, REGION(sh));
+  fflush(stdout);
+  for (i = 0; i < ITEMS; i++) {
+    snprintf(path, sizeof path, "/workers/#%d/done", w);
+    snprintf(key, sizeof key, "w%d-%03d", w, i);
+    Tandel_AcquireExclLock(&sh->demoLock);
+    HSTAA_Insert(&h.aa, path, 1);
+    Tandel_ReleaseExclLock(&sh->demoLock);
+
+    Tandel_AcquireExclLock(&sh->demoLock);
+    RBT_Insert(&h.rbt, key, (CofferVal)(w * 1000 + i));
+    Tandel_ReleaseExclLock(&sh->demoLock);
+
+    Tandel_AcquireExclLock(&sh->demoLock);
+    ESA_Insert(&h.esa, key, (CofferVal)(w * 1000 + i));
+    Tandel_ReleaseExclLock(&sh->demoLock);
+  }
+  /* Take every odd item out of the tree again. */
+  for (i = 1; i < ITEMS; i += 2) {
+    RbtNode *n;
+    snprintf(key, sizeof key, "w%d-%03d", w, i);
+    Tandel_AcquireExclLock(&sh->demoLock);
+    n = RBT_Find(&h.rbt, key);
+    if (n) RBT_Remove(&h.rbt, n);
+    Tandel_ReleaseExclLock(&sh->demoLock);
+  }
+  munmap(sh, size);
+  _exit(0);
+}
+
+/* Walks the region's blocks: they must tile it exactly, and the free list
+ * must hold exactly the free blocks. Returns the number of blocks. */
+static int CheckHeap(void *region, int *freeBlocks) {
+  ShRegionHeader *hdr = (ShRegionHeader *)region;
+  uint32_t o = 16, listed = 0, f;
+  int blocks = 0, nfree = 0;
+  uint32_t prev = 0;
+  while (o < hdr->regionSize) {
+    ShBlockHeader *b = (ShBlockHeader *)((char *)region + o);
+    if (b->prevBlockSize != prev || b->blockSize < 16) return -1;
+    if (b->nextFree || b->prevFree) nfree++;
+    blocks++;
+    prev = b->blockSize;
+    o += b->blockSize;
+  }
+  if (o != hdr->regionSize) return -1;
+  for (f = hdr->freeHead; f != SH_NO_BLOCK; f = ((ShBlockHeader *)((char *)region + f))->nextFree)
+    if (++listed > (uint32_t)blocks) return -1;
+  if ((int)listed != nfree) return -1;
+  *freeBlocks = nfree;
+  return blocks;
+}
+
+static int Fail(const char *what) {
+  printf("FAILED: %s\n", what);
+  return 1;
+}
+
+int main(void) {
+  char name[64];
+  size_t size = sizeof(Shared) + REGION_SIZE;
+  Shared *sh;
+  Handles h;
+  HstTree *hst;
+  RbtTree *rbt;
+  EsaArray *esa;
+  HstNode *root;
+  int fd, w, i, status, blocks, freeBlocks, errors = 0;
+  pid_t pids[WORKERS];
+
+  snprintf(name, sizeof name, "/coffer-demo-%d", (int)getpid());
+  fd = shm_open(name, O_RDWR | O_CREAT | O_EXCL, 0600);
+  if (fd < 0 || ftruncate(fd, (off_t)size) != 0) {
+    perror("shared memory object");
+    return 1;
+  }
+  shm_unlink(name); /* the open descriptor keeps it alive for the workers */
+  sh = MapObject(fd, size);
+  Tandel_InitExclLock(&sh->heapLock);
+  Tandel_InitExclLock(&sh->demoLock);
+
+  /* Format the region and build the containers in it. */
+  MemPool_InitOnSharedHeap(&h.pool, REGION(sh), REGION_SIZE, &sh->heapLock);
+  hst = HST_AllocTreeEx(&h.pool, '/', 0, 4, 4);
+  rbt = RBT_AllocTreeEx(&h.pool);
+  esa = ESA_AllocArrayEx(&h.pool, 16, 64);
+  if (!hst || !rbt || !esa) return Fail("creating the containers");
+  sh->hstData = Off(&h.pool, hst->data);
+  sh->rbtData = Off(&h.pool, rbt->data);
+  sh->esaData = Off(&h.pool, esa->data);
+  MakeHandles(&h, sh);
+  /* The array template: every worker's element starts as a copy of it. */
+  HSTAA_Insert(&h.aa, "/workers/#/limit", LIMIT);
+  printf("parent: region of %d bytes at %p, template /workers/#/limit = %d\n", REGION_SIZE,
+         REGION(sh), LIMIT);
+  fflush(stdout);
+
+  for (w = 0; w < WORKERS; w++) {
+    pids[w] = fork();
+    if (pids[w] == 0) Worker(fd, size, sh, w);
+  }
+  for (w = 0; w < WORKERS; w++)
+    if (waitpid(pids[w], &status, 0) < 0 || !WIFEXITED(status) || WEXITSTATUS(status) != 0)
+      errors += Fail("a worker did not finish cleanly");
+
+  /* Every container must hold exactly what the workers put there. */
+  root = HST_GetRoot(&h.aa.hst);
+  if (HSTAA_GetSubtreeValCount(&h.aa, root) != 1 + WORKERS * (1 + ITEMS))
+    errors += Fail("value count of the associative array");
+  for (w = 0; w < WORKERS; w++) {
+    char path[64];
+    HstNode *n;
+    snprintf(path, sizeof path, "/workers/#%d/done", w);
+    n = HST_Find(&h.aa.hst, path);
+    if (!n || HST_GetVal(&h.aa.hst, n) != ITEMS) errors += Fail(path);
+    snprintf(path, sizeof path, "/workers/#%d/limit", w);
+    n = HST_Find(&h.aa.hst, path);
+    if (!n || HST_GetVal(&h.aa.hst, n) != LIMIT) errors += Fail(path);
+  }
+  if (ESA_GetSize(&h.esa) != WORKERS * ITEMS) errors += Fail("size of the sorted array");
+  for (i = 1; i < ESA_GetSize(&h.esa); i++)
+    if (strcmp(ESA_GetKey(&h.esa, i - 1), ESA_GetKey(&h.esa, i)) >= 0)
+      errors += Fail("order of the sorted array");
+  if (RBT_GetSize(&h.rbt) != WORKERS * ((ITEMS + 1) / 2)) errors += Fail("size of the tree");
+  {
+    RbtNode *n = RBT_First(&h.rbt);
+    for (i = 0; n; n = RBT_Next(&h.rbt, n), i++) {
+      if ((n->val % 1000) % 2 != 0) errors += Fail("an odd item is still in the tree");
+    }
+    if (i != RBT_GetSize(&h.rbt)) errors += Fail("walk of the tree");
+  }
+  blocks = CheckHeap(REGION(sh), &freeBlocks);
+  if (blocks < 0) errors += Fail("heap consistency");
+  printf("parent: %d workers done; tree %d nodes, array %d entries, %d values in the "
+         "associative array; heap %d blocks (%d free)\n",
+         WORKERS, (int)RBT_GetSize(&h.rbt), (int)ESA_GetSize(&h.esa),
+         (int)HSTAA_GetSubtreeValCount(&h.aa, root), blocks, freeBlocks);
+
+  /* Free everything: the region must be one free block again. */
+  HST_FreeTree(hst);
+  RBT_FreeTree(rbt);
+  ESA_FreeArray(esa);
+  blocks = CheckHeap(REGION(sh), &freeBlocks);
+  if (blocks != 1 || freeBlocks != 1) errors += Fail("region whole again after freeing");
+  printf("parent: after freeing every container the region is %s\n",
+         blocks == 1 ? "one free block again" : "NOT whole");
+  Tandel_DestroyExclLock(&sh->demoLock);
+  Tandel_DestroyExclLock(&sh->heapLock);
+  munmap(sh, size);
+  close(fd);
+  printf(errors ? "demo FAILED\n" : "demo OK\n");
+  return errors ? 1 : 0;
+}
