@@ -41,9 +41,6 @@ struct StringKey {
     }
     void WentLeft() { lcpHigh = stop; }
     void WentRight() { lcpLow = stop; }
-    bool Equal(const RbtNode *x) const {
-      return std::strcmp(reinterpret_cast<const char *>(key), At<const char>(tree, x->key)) == 0;
-    }
   };
 };
 

@@ -12,7 +12,7 @@
 //                                  before, equals or follows the node's key,
 //                                  WentLeft()/WentRight() after each step (the
 //                                  string family keeps its common prefixes
-//                                  there), Equal(node) for the equal-run walks
+//                                  there)
 //
 // Every instance is a hidden function of its family; the exported calls are
 // thin wrappers around them (COFFER_RBT_DEFINE_FAMILY below).
@@ -135,53 +135,41 @@ RbtNode *Find(RbtTree *tree, typename K::Arg key) {
   return nullptr;
 }
 
-// The descent shared by both bounds: returns the bound directly when the key
-// is absent, or the first equal node met (with *equal set).
-template <class K>
-RbtNode *BoundDescent(const RbtCtx &c, typename K::Probe &probe, bool *equal) {
-  *equal = false;
-  PoolOffset xo = c.d->root;
-  if (xo == c.nilOff) return nullptr;
-  for (;;) {
+// Both bounds are one descent that remembers the last node where it went
+// left: going left on equality too finds the first of an equal run, going
+// right on it finds the first node past the run, without walking the run.
+// The common-prefix bounds stay valid, since an equal key bounds the subtree
+// it leads into like any other.
+template <class K, bool kPastEqual>
+RbtNode *Bound(RbtTree *tree, typename K::Arg key) {
+  RbtCtx c(tree);
+  typename K::Probe probe(tree, key);
+  RbtNode *bound = nullptr;
+  for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
     RbtNode *x = c.N(xo);
     int r = probe.Compare(x);
-    if (r < 0) {
-      if (x->left == c.nilOff) return x;
+    if (kPastEqual ? r < 0 : r <= 0) {
+      bound = x;
       probe.WentLeft();
       xo = x->left;
-    } else if (r > 0) {
-      if (x->right == c.nilOff) return c.OrNull(RBTSuccessor(c, x));
+    } else {
       probe.WentRight();
       xo = x->right;
-    } else {
-      *equal = true;
-      return x;
     }
   }
+  return bound;
 }
 
+// The first node whose key is not less than key.
 template <class K>
 RbtNode *LowerBound(RbtTree *tree, typename K::Arg key) {
-  RbtCtx c(tree);
-  typename K::Probe probe(tree, key);
-  bool equal;
-  RbtNode *x = BoundDescent<K>(c, probe, &equal);
-  if (!equal) return x;
-  for (RbtNode *p = RBTPredecessor(c, x); p != c.nil && probe.Equal(p); p = RBTPredecessor(c, p))
-    x = p;
-  return x;
+  return Bound<K, false>(tree, key);
 }
 
+// The first node whose key is greater than key.
 template <class K>
 RbtNode *UpperBound(RbtTree *tree, typename K::Arg key) {
-  RbtCtx c(tree);
-  typename K::Probe probe(tree, key);
-  bool equal;
-  RbtNode *x = BoundDescent<K>(c, probe, &equal);
-  if (!equal) return x;
-  do x = RBTSuccessor(c, x);
-  while (x != c.nil && probe.Equal(x));
-  return c.OrNull(x);
+  return Bound<K, true>(tree, key);
 }
 
 // Key-independent calls, shared by the wrappers of every family.

@@ -24,7 +24,6 @@ struct WordKey {
     int Compare(const RbtNode *x) const { return Order::Compare(key, x->key); }
     void WentLeft() {}
     void WentRight() {}
-    bool Equal(const RbtNode *x) const { return x->key == key; }
   };
 };
 
