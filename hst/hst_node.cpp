@@ -106,11 +106,13 @@ COFFER_API HstNode *HST_FindChild(HstTree *tree, HstNode *node, const char *key)
 
 COFFER_API HstNode *HSTAllocNode(HstTree *tree, const char *key, CofferVal val) {
   if (!key) return nullptr;
+  // Both allocations are always asked for, key copy first, so a pool sees
+  // the same sequence of calls whichever of them it refuses.
   char *keyCopy = PoolStrdup(tree, key);
-  if (!keyCopy) return nullptr;
   auto *node = static_cast<HstNode *>(PoolCalloc(tree, sizeof(HstNode)));
-  if (!node) {
+  if (!keyCopy || !node) {
     PoolFree(tree, keyCopy);
+    PoolFree(tree, node);
     return nullptr;
   }
   node->key = Off(tree, keyCopy);
