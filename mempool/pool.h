@@ -22,6 +22,18 @@ inline PoolOffset AddrToOffset(const MemPool *mp, const void *p) {
            : 0;
 }
 
+// count x size for a pool's calloc; false when the product does not fit in
+// 32 bits (a wrapped product would hand out a block too small).
+inline bool CallocBytes(size_t count, size_t size, size_t *bytes) {
+  if (size != 0 && count > static_cast<size_t>(0xFFFFFFFFu) / size) return false;
+  *bytes = count * size;
+  return true;
+}
+
+// Messages of the pools that treat exhaustion as fatal.
+constexpr const char *kOutOfMemory = "Out of memory trying to allocate %zu bytes.";
+constexpr const char *kCallocOverflow = "%s: integer overflow (%zu, %zu";
+
 // Typed view of an offset in a container's pool.
 template <class T>
 inline T *At(const CollectionHeader *h, PoolOffset off) {

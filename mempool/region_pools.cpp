@@ -9,15 +9,9 @@
 
 namespace {
 
-constexpr const char *kOutOfMemory = "Out of memory trying to allocate %zu bytes.";
-constexpr const char *kOverflow = "%s: integer overflow (%zu, %zu";
-
-// count x size in 32 bits; false when the product does not fit.
-bool Product(size_t count, size_t size, size_t *n) {
-  if (size != 0 && count > static_cast<size_t>(0xFFFFFFFFu) / size) return false;
-  *n = count * size;
-  return true;
-}
+using coffer::CallocBytes;
+using coffer::kCallocOverflow;
+using coffer::kOutOfMemory;
 
 // The shared operations read the lock handle once, before acquiring it, and
 // release that same handle: the record they are called through may live in
@@ -37,7 +31,7 @@ void *MemPoolSharedHeapAlloc(MemPool *pool, size_t size) {
 
 void *MemPoolSharedHeapCalloc(MemPool *pool, size_t count, size_t size) {
   size_t n;
-  if (!Product(count, size, &n)) Panic(kOverflow, "MemPoolSharedHeapCalloc", count, size);
+  if (!CallocBytes(count, size, &n)) Panic(kCallocOverflow, "MemPoolSharedHeapCalloc", count, size);
   void *p = MemPoolSharedHeapAlloc(pool, n);
   std::memset(p, 0, n);
   return p;
@@ -65,7 +59,7 @@ void *MemPoolSimpleHeapAlloc(MemPool *pool, size_t size) { return SH_Alloc(pool-
 
 void *MemPoolSimpleHeapCalloc(MemPool *pool, size_t count, size_t size) {
   size_t n;
-  if (!Product(count, size, &n)) return nullptr;  // a wrapped product would be too small
+  if (!CallocBytes(count, size, &n)) return nullptr;  // a wrapped product would be too small
   void *p = SH_Alloc(pool->base, n);
   if (p) std::memset(p, 0, n);
   return p;

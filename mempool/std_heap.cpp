@@ -6,27 +6,26 @@
 
 namespace {
 
-constexpr const char *kOutOfMemory = "Out of memory trying to allocate %zu bytes.";
-
 void *MemPoolStdHeapAlloc(MemPool *, size_t size) {
   void *p = std::malloc(size);
-  if (!p) Panic(kOutOfMemory, size);
+  if (!p) Panic(coffer::kOutOfMemory, size);
   return p;
 }
 
 void *MemPoolStdHeapCalloc(MemPool *, size_t count, size_t size) {
   // Refuse a product that does not fit in 32 bits, so the report below can
   // show the exact size that was asked for.
-  if (size != 0 && count > static_cast<size_t>(0xFFFFFFFFu) / size)
-    Panic("%s: integer overflow (%zu, %zu", "MemPoolStdHeapCalloc", count, size);
+  size_t bytes;
+  if (!coffer::CallocBytes(count, size, &bytes))
+    Panic(coffer::kCallocOverflow, "MemPoolStdHeapCalloc", count, size);
   void *p = std::calloc(count, size);
-  if (!p) Panic(kOutOfMemory, count * size);
+  if (!p) Panic(coffer::kOutOfMemory, bytes);
   return p;
 }
 
 void *MemPoolStdHeapRealloc(MemPool *, void *ptr, size_t size) {
   void *p = std::realloc(ptr, size);
-  if (!p && size != 0) Panic(kOutOfMemory, size);
+  if (!p && size != 0) Panic(coffer::kOutOfMemory, size);
   return p;
 }
 

@@ -309,15 +309,9 @@ RbtTree *RBTAllocTreeOnStdHeap() {
 void RBTSwap(RbtTree *tree, RbtTree *other) {
   auto *a = static_cast<RbtTreeData *>(tree->data);
   auto *b = static_cast<RbtTreeData *>(other->data);
-  RbtTreeData tmp = *a;
-  a->root = b->root;
-  a->nil = b->nil;
-  a->ownsNil = b->ownsNil;
-  a->size = b->size;
-  b->root = tmp.root;
-  b->nil = tmp.nil;
-  b->ownsNil = tmp.ownsNil;
-  b->size = tmp.size;
+  RbtTreeData tmp = *a;  // root, nil, ownsNil and size: the whole record
+  *a = *b;
+  *b = tmp;
 }
 
 }  // namespace coffer
