@@ -111,8 +111,9 @@ COFFER_API HstNode *HSTAllocNode(HstTree *tree, const char *key, CofferVal val) 
   char *keyCopy = PoolStrdup(tree, key);
   auto *node = static_cast<HstNode *>(PoolCalloc(tree, sizeof(HstNode)));
   if (!keyCopy || !node) {
-    PoolFree(tree, keyCopy);
-    PoolFree(tree, node);
+    // Only what was granted goes back: a pool sees no free of a null block.
+    if (keyCopy) PoolFree(tree, keyCopy);
+    if (node) PoolFree(tree, node);
     return nullptr;
   }
   node->key = Off(tree, keyCopy);

@@ -1,96 +1,106 @@
-// Allocation refused at every point of every call that allocates: the result
-// reports it, the tree is left as documented and nothing leaks.
-#include <algorithm>
-
+// The exact pool calls of the tree's operations, and allocation refused at
+// every point of every call that allocates: the result reports it, the tree
+// is left as documented and nothing leaks.
+#include "../esa/pool_log.h"
 #include "hst_check.h"
 
 namespace {
 
 using coffer_test::Released;
 using coffer_test::TestPool;
-using hst_test::CheckTree;
-using hst_test::Dump;
-using hst_test::Script;
-using V = std::vector<CofferVal>;
+using namespace hst_test;
 
-constexpr CofferVal kDefault = 0xDEF0;
-
-// Blocks of a child array that a failed call may leave behind, empty, on a
-// node that had none before.
-size_t KeptArrayBlocks(HstTree *tree, HstNode *node, bool hadArray) {
-  if (hadArray || !node->children) return 0;
-  auto *arr = coffer::At<EsaArrayData>(tree, node->children);
-  EXPECT_EQ(arr->size, 0);
-  return 1 + (arr->entries != 0);
+bool LoggedClone(HstTree *, CofferVal val, CofferVal *out) {
+  pool_log::Add("k" + std::to_string(val));
+  *out = val + 100;
+  return true;
 }
 
-TEST(HstFailure, AllocTreeExAtEveryPoint) {
-  for (bool from : {false, true}) {
-    long points = 0;
-    for (long n = 0;; n++) {
+// Every pool call (with its size) and every callback, in order.
+TEST(HstPoolCalls, OrderOfAWholeLife) {
+  TestPool tp;
+  MemPool logged = pool_log::Wrap(tp.pool());
+  HstTree *t = HST_AllocTreeEx(&logged, '/', 7, 1, 1);
+  EXPECT_EQ(pool_log::Take(), "c1x40 c1x24 a1 c1x20");  // handle, record, root key, root
+  HST_SetFreeValFn(t, pool_log::Value);
+  HstNode *root = HST_GetRoot(t);
+  // Per new node: the parent's array (record, block) when it has none, the
+  // key copy, the node, the entry (growing a full block) with its key copy.
+  HST_Insert(t, "/a/bc", 3);
+  EXPECT_EQ(pool_log::Take(), "c1x16 r0:8 a2 c1x20 a2 c1x16 r0:8 a3 c1x20 a3");
+  HST_InsertChild(t, root, "z", 9);
+  EXPECT_EQ(pool_log::Take(), "a2 c1x20 r16 a2");
+  HstNode *a = HST_Find(t, "/a");
+  HST_SetVal(t, a, 5);
+  // Clone: value, node (key, node), children, rename, attach.
+  HST_CloneSubtree(t, a, LoggedClone, "q", HST_Find(t, "/z"));
+  EXPECT_EQ(pool_log::Take(), "k5 a2 c1x20 k3 a3 c1x20 c1x16 r0:8 a3 a2 f c1x16 r0:8 a2");
+  // Unlink (entry key, shrink), then depth first: value, array, key, node.
+  HST_RemoveSubtree(t, a);
+  EXPECT_EQ(pool_log::Take(), "f r8 v3 f f v5 f r0 f f f");
+  HST_FreeTree(t);
+  EXPECT_EQ(pool_log::Take(), "v103 f f v105 f r0 f f f v9 f r0 f f f f r0 f v7 f f f f");
+  // Refusals: the key copy, the node, the entry's key copy. Only what was
+  // granted is freed; the node is asked for even when the key was refused.
+  t = HST_AllocTreeEx(&logged, '/', 0, 1, 1);
+  pool_log::Take();
+  for (long n : {2, 1, 2}) {
+    tp.FailAt(tp.calls() + n);
+    EXPECT_EQ(HST_InsertChild(t, HST_GetRoot(t), "k", 1), nullptr);
+  }
+  EXPECT_EQ(pool_log::Take(), "c1x16 r0:8 a2 c1x20 f a2 c1x20 f a2 c1x20 a2 f f");
+  tp.FailAt(tp.calls() + 1);
+  EXPECT_EQ(HST_Insert(t, "/k", 1), nullptr);  // a failed walk stores nothing
+  HST_FreeTree(t);
+  EXPECT_EQ(pool_log::Take(), "a2 c1x20 f f f f f f f");
+  EXPECT_EQ(tp.liveBlocks(), 0u);
+}
+
+TEST(HstFailure, CreationAtEveryPoint) {
+  for (long n = 0; n < 5; n++) {
+    for (bool from : {false, true}) {
       TestPool tp;
       from ? tp.FailFrom(n) : tp.FailAt(n);
       HstTree *t = HST_AllocTreeEx(tp.pool(), '/', kDefault, 2, 2);
-      if (t) {
-        EXPECT_EQ(HST_GetSize(t), 1);
-        CheckTree(t);
-        HST_FreeTree(t);
-        EXPECT_EQ(tp.liveBlocks(), 0u);
-        break;
-      }
-      points++;
+      EXPECT_EQ(t == nullptr, n < 4);  // handle, data record, root key, root node
+      HST_FreeTree(t);
       EXPECT_EQ(tp.liveBlocks(), 0u) << n;
-      // Every block the pool granted goes back: the node is asked for even
-      // when the root's key copy was refused.
-      EXPECT_EQ(tp.frees(), from ? n : tp.calls() - 1) << "each block made goes back";
     }
-    EXPECT_EQ(points, 4);  // handle, data record, root key, root node
-  }
-}
-
-TEST(HstFailure, CreateTreeDataOnCallerHandle) {
-  for (long n = 0; n < 3; n++) {
+    // On a handle the caller keeps, data is null again after a failure.
     TestPool tp;
     CollectionHeader h;
     std::memset(&h, 0, sizeof h);
     h.mp = *tp.pool();
     tp.FailAt(n);
-    EXPECT_FALSE(HST_CreateTreeData(&h, '/', kDefault, 2, 2));
-    EXPECT_EQ(h.data, nullptr);
+    EXPECT_EQ(HST_CreateTreeData(&h, '/', kDefault, 2, 2), n >= 3);
+    EXPECT_EQ(h.data == nullptr, n < 3);
+    HST_FreeTree(&h);
     EXPECT_EQ(tp.liveBlocks(), 0u);
   }
 }
 
-TEST(HstFailure, AllocNodeAndReplaceKey) {
+TEST(HstFailure, ReplaceKeyAndAttach) {
   TestPool tp;
   HstTree *t = HST_AllocTreeEx(tp.pool(), '/', kDefault, 2, 2);
+  HstNode *root = HST_GetRoot(t);
   const size_t live = tp.liveBlocks();
-  for (long n = 0; n < 2; n++) {
-    tp.FailAt(tp.calls() + n);
-    EXPECT_EQ(HSTAllocNode(t, "k", 1), nullptr);
-    EXPECT_EQ(HST_GetSize(t), 1);
-    EXPECT_EQ(tp.liveBlocks(), live);
-  }
-  tp.NeverFail();
   HstNode *d = HSTAllocNode(t, "old", 1);
   tp.FailAt(tp.calls());
   EXPECT_FALSE(HSTReplaceKey(t, d, "new"));
   EXPECT_STREQ(HST_GetKey(t, d), "old");
-  EXPECT_EQ(tp.liveBlocks(), live + 2);
-  // Attaching a detached node: the child array, its entry block, the entry's
-  // key copy. The node stays detached and whole on every failure.
+  // Attaching: the child array, its entry block, the entry's key copy. The
+  // node stays detached and whole on every failure.
   for (long n = 0;; n++) {
     tp.FailAt(tp.calls() + n);
-    const bool hadArray = HST_GetRoot(t)->children != 0;
-    HstNode *got = HSTInsertChildNode(t, HST_GetRoot(t), d);
-    if (got) {
+    const bool hadArray = root->children != 0;
+    if (HSTInsertChildNode(t, root, d)) {
       EXPECT_EQ(n, 3);
       break;
     }
     EXPECT_EQ(d->parent, 0u);
     EXPECT_STREQ(HST_GetKey(t, d), "old");
-    EXPECT_EQ(HST_GetNumChildren(t, HST_GetRoot(t)), 0);
-    EXPECT_EQ(tp.liveBlocks(), live + 2 + KeptArrayBlocks(t, HST_GetRoot(t), hadArray));
+    EXPECT_EQ(HST_GetNumChildren(t, root), 0);
+    EXPECT_EQ(tp.liveBlocks(), live + 2 + KeptArrayBlocks(t, root, hadArray));
   }
   EXPECT_EQ(HST_Find(t, "/old"), d);
   tp.NeverFail();
@@ -114,40 +124,30 @@ struct Fresh {
   }
 };
 
-// HST_InsertChild under a node without children (the array is made first)
-// and under one whose array is full (the entry block grows).
+// Under a node without children (the array is made first) and under one
+// whose array is full (the entry block grows).
 TEST(HstFailure, InsertChildAtEveryPoint) {
   for (int full = 0; full < 2; full++) {
-    SCOPED_TRACE(full);
     long points = 0;
     for (long n = 0;; n++) {
       Fresh f(2);
-      HstTree *t = f.t;
-      HstNode *parent = HST_Insert(t, "/p", 1);
-      if (full) {
-        HST_Insert(t, "/p/a", 2);
-        HST_Insert(t, "/p/c", 3);
-      }
+      HstNode *parent = HST_Insert(f.t, "/p", 1);
+      if (full) HST_Insert(f.t, "/p/a", 2), HST_Insert(f.t, "/p/c", 3);
       Released().clear();
       const bool hadArray = parent->children != 0;
-      const std::string before = Dump(t);
+      const std::string before = Dump(f.t);
       const size_t live = f.tp.liveBlocks();
       f.tp.FailAt(f.tp.calls() + n);
-      HstNode *got = HST_InsertChild(t, parent, "b", 9);
-      f.tp.NeverFail();
+      HstNode *got = HST_InsertChild(f.t, parent, "b", 9);
       if (got) {
-        EXPECT_EQ(HST_GetVal(t, got), 9u);
-        EXPECT_EQ(HST_GetChild(t, parent, full ? 1 : 0), got);
-        CheckTree(t);
+        EXPECT_EQ(HST_GetChild(f.t, parent, full), got);
         break;
       }
       points++;
-      EXPECT_EQ(Dump(t), before);
-      EXPECT_EQ(f.tp.liveBlocks(), live + KeptArrayBlocks(t, parent, hadArray));
+      EXPECT_EQ(Dump(f.t), before);
+      EXPECT_EQ(f.tp.liveBlocks(), live + KeptArrayBlocks(f.t, parent, hadArray));
       EXPECT_TRUE(Released().empty()) << "a value never stored is not released";
     }
-    // Array record and entry block, key, node, entry key; or key, node,
-    // growth, entry key.
     EXPECT_EQ(points, full ? 4 : 5);
   }
 }
@@ -158,43 +158,37 @@ TEST(HstFailure, InsertPathAtEveryPoint) {
   long points = 0;
   for (long n = 0;; n++) {
     Fresh f(1);
-    HstTree *t = f.t;
-    HST_Insert(t, "/a", 1);
+    HST_Insert(f.t, "/a", 1);
     Released().clear();
     const size_t live = f.tp.liveBlocks();
-    char path[] = "/a/b/c/";
     f.tp.FailAt(f.tp.calls() + n);
-    HstNode *got = HST_Insert(t, path, 7);
+    HstNode *got = HST_Insert(f.t, "/a/b/c/", 7);
     f.tp.NeverFail();
-    EXPECT_STREQ(path, "/a/b/c/");
     if (got) {
-      EXPECT_EQ(got, HST_Find(t, "/a/b/c"));
-      EXPECT_EQ(HST_GetVal(t, got), 7u);
-      EXPECT_EQ(HST_GetVal(t, HST_Find(t, "/a/b")), kDefault);
+      EXPECT_EQ(got, HST_Find(f.t, "/a/b/c"));
+      EXPECT_EQ(HST_GetVal(f.t, got), 7u);
       break;
     }
     points++;
-    CheckTree(t);
+    CheckTree(f.t);
     EXPECT_TRUE(Released().empty());
-    EXPECT_EQ(HST_Find(t, "/a/b/c"), nullptr);
-    HstNode *b = HST_Find(t, "/a/b");
-    if (b) {
-      EXPECT_EQ(HST_GetVal(t, b), kDefault);
-      EXPECT_EQ(HST_GetNumChildren(t, b), 0);
-    }
-    EXPECT_EQ(HST_GetSize(t), b ? 3 : 2);
-    EXPECT_EQ(HST_GetVal(t, HST_Find(t, "/a")), 1u);
-    // Without b, only a's (empty) new child array may remain.
-    if (!b) {
-      EXPECT_EQ(f.tp.liveBlocks(), live + KeptArrayBlocks(t, HST_Find(t, "/a"), false));
-    }
+    EXPECT_EQ(HST_Find(f.t, "/a/b/c"), nullptr);
+    HstNode *b = HST_Find(f.t, "/a/b");
+    EXPECT_TRUE(!b || HST_GetVal(f.t, b) == kDefault);
+    // b's key, node and entry key, and the child arrays made on the way.
+    size_t blocks = live + (b ? 3 : 0);
+    for (HstNode *n : {HST_Find(f.t, "/a"), b})
+      if (n && n->children)
+        blocks += 1 + (coffer::At<EsaArrayData>(f.t, n->children)->entries != 0);
+    EXPECT_EQ(f.tp.liveBlocks(), blocks);
+    EXPECT_EQ(HST_GetSize(f.t), b ? 3 : 2);
+    EXPECT_EQ(HST_GetVal(f.t, HST_Find(f.t, "/a")), 1u);
   }
   EXPECT_EQ(points, 10);  // five for each of b and c
 }
 
-// Cloning with every allocation refused in turn, under a destination that
-// already has children and under a leaf: nothing is attached, the tree reads
-// exactly as before, every value copied goes back once, nothing leaks.
+// Under a destination that has children and under a leaf: nothing attached,
+// the tree reads exactly as before, every copied value goes back once.
 TEST(HstFailure, CloneAtEveryAllocationPoint) {
   for (bool from : {false, true}) {
     for (int leaf = 0; leaf < 2; leaf++) {
@@ -208,19 +202,17 @@ TEST(HstFailure, CloneAtEveryAllocationPoint) {
       HST_SetVal(t, HST_Find(t, "/s"), 1);
       HST_Insert(t, "/d/e", 5);
       HSTAAAdjustSubtreeValCount(t, HST_Find(t, "/s/a/x"), 1);
-      HstNode *src = HST_Find(t, "/s");
       long points = 0;
       for (long n = 0;; n++) {
         HstNode *dst = HST_Find(t, leaf ? "/d/e" : "/d");
-        hst_test::ResetLogs();
+        ResetLogs();
         const bool hadArray = dst->children != 0;
         const std::string before = Dump(t);
         const size_t live = tp.liveBlocks();
         from ? tp.FailFrom(tp.calls() + n) : tp.FailAt(tp.calls() + n);
-        HstNode *got = HST_CloneSubtree(t, src, hst_test::ScriptedClone, "t", dst);
+        HstNode *got = HST_CloneSubtree(t, HST_Find(t, "/s"), ScriptedClone, "t", dst);
         tp.NeverFail();
         if (got) {
-          EXPECT_EQ(HST_GetParent(t, got), dst);
           EXPECT_EQ(got->subtreeValCount, 1);
           EXPECT_TRUE(Released().empty());
           break;
@@ -228,19 +220,14 @@ TEST(HstFailure, CloneAtEveryAllocationPoint) {
         points++;
         EXPECT_EQ(Dump(t), before);
         EXPECT_EQ(tp.liveBlocks(), live + KeptArrayBlocks(t, dst, hadArray));
-        V want, got2;
-        for (auto &m : Script().made) want.push_back(m.second);
-        for (CofferVal v : Released())
-          if (v != kDefault) got2.push_back(v);
-        std::sort(got2.begin(), got2.end());
-        EXPECT_EQ(got2, want);
-        CheckTree(t);
+        ExpectCopiesReleased();
       }
-      // Five copied nodes: key and node each; s' and a' get an array and an
-      // entry block; four entries inside the copy, two of them growing a
-      // full block; the rename; under /d growth and entry key, under the leaf
-      // an array, its block and the entry key.
+      // Five copied nodes: key and node each; s' and a' an array and block
+      // each; four entries inside the copy, two growing a full block; the
+      // rename; under /d growth and entry key, under the leaf an array, its
+      // block and the entry key.
       EXPECT_EQ(points, leaf ? 24 : 23);
+      CheckTree(t);
       HST_FreeTree(t);
       EXPECT_EQ(tp.liveBlocks(), 0u);
     }

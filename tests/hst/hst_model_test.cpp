@@ -1,6 +1,6 @@
 // Randomized comparison of the string tree with a plain model tree: after
-// every step the whole tree (names, order, values, counts, parent links,
-// size) and the exact sequence of released values must agree.
+// every step the whole tree (names, order, values, counts, size), its links
+// and the exact sequence of released values must agree.
 #include <algorithm>
 #include <memory>
 #include <random>
@@ -11,14 +11,11 @@ namespace {
 
 using coffer_test::Released;
 using coffer_test::ReleasedPools;
-using coffer_test::TestPool;
-using hst_test::Script;
-
-constexpr CofferVal kDefault = 0xDEF0;
+using namespace hst_test;
 
 struct M {
   std::string key;
-  CofferVal val = 0;
+  CofferVal val = kDefault;
   int32_t svc = 0;
   M *parent = nullptr;
   std::vector<std::unique_ptr<M>> kids;  // strcmp order, equal names in insertion order
@@ -29,13 +26,9 @@ struct M {
 M *MFind(M *node, const std::string &name) {
   int lo = 0, hi = static_cast<int>(node->kids.size()) - 1;
   while (lo <= hi) {
-    int mid = (lo + hi) / 2;
-    int c = std::strcmp(name.c_str(), node->kids[mid]->key.c_str());
+    int mid = (lo + hi) / 2, c = std::strcmp(name.c_str(), node->kids[mid]->key.c_str());
     if (c == 0) return node->kids[mid].get();
-    if (c > 0)
-      lo = mid + 1;
-    else
-      hi = mid - 1;
+    c > 0 ? lo = mid + 1 : hi = mid - 1;
   }
   return nullptr;
 }
@@ -56,67 +49,43 @@ M *MInsertChild(M *parent, const std::string &key, CofferVal val) {
   return MAttach(parent, std::move(child));
 }
 
-// The names a path walks through, read independently of the tree's walk.
-std::vector<std::string> Split(const std::string &path, char sep) {
-  std::vector<std::string> names;
-  std::string rest = path.substr(1);
-  if (rest.empty()) return names;
-  size_t start = 0;
-  for (;;) {
-    size_t at = rest.find(sep, start);
-    if (at == std::string::npos) {
-      names.push_back(rest.substr(start));
-      return names;
-    }
-    names.push_back(rest.substr(start, at - start));
-    if (at + 1 == rest.size()) return names;  // a trailing separator ends the walk
-    start = at + 1;
-  }
-}
-
-M *MWalk(M *root, const std::string &path, char sep, bool create) {
-  M *node = root;
-  for (const std::string &name : Split(path, sep)) {
+// Walks the names of a path, read independently of the tree's walk: the
+// first character skipped, a trailing separator ending the walk.
+M *MWalk(M *node, const std::string &path, char sep, bool create) {
+  for (size_t start = 1; start < path.size();) {
+    size_t at = std::min(path.find(sep, start), path.size());
+    std::string name = path.substr(start, at - start);
     M *child = MFind(node, name);
     if (!child && create) child = MInsertChild(node, name, kDefault);
     if (!child) return nullptr;
     node = child;
+    start = at + 1;
   }
   return node;
 }
 
-int32_t MRelease(M *node, std::vector<CofferVal> *log) {
-  int32_t n = 1;
-  for (auto &kid : node->kids) n += MRelease(kid.get(), log);
+void MRelease(M *node, V *log) {
+  for (auto &kid : node->kids) MRelease(kid.get(), log);
   log->push_back(node->val);
-  return n;
 }
 
-void MClear(M *root, std::vector<CofferVal> *log) {
-  for (auto &kid : root->kids) MRelease(kid.get(), log);
-  log->push_back(root->val);
+void MClear(M *root, V *log) {
+  MRelease(root, log);
   root->kids.clear();
   root->val = kDefault;
   root->svc = 0;
 }
 
-std::unique_ptr<M> MCopy(const M *src, size_t *made) {
-  auto copy = std::make_unique<M>();
-  copy->key = src->key;
-  copy->svc = src->svc;
-  copy->val = kDefault;
-  if (src->val != kDefault) {
-    const auto &calls = Script().made;
-    EXPECT_LT(*made, calls.size());
-    if (*made < calls.size()) {
-      EXPECT_EQ(calls[*made].first, src->val) << "clone callback called out of order";
-      copy->val = calls[(*made)++].second;
-    }
+// The copy, with the values the clone callback handed out in call order.
+std::unique_ptr<M> MCopy(const M *src, size_t *used) {
+  auto copy = std::make_unique<M>(M{src->key, kDefault, src->svc, nullptr, {}});
+  if (src->val != kDefault && *used < Script().made.size()) {
+    EXPECT_EQ(Script().made[*used].first, src->val) << "clone callback called out of order";
+    copy->val = Script().made[(*used)++].second;
   }
   for (const auto &kid : src->kids) {
-    auto k = MCopy(kid.get(), made);
-    k->parent = copy.get();
-    copy->kids.push_back(std::move(k));
+    copy->kids.push_back(MCopy(kid.get(), used));
+    copy->kids.back()->parent = copy.get();
   }
   return copy;
 }
@@ -127,171 +96,122 @@ int32_t MCountVals(const M *node) {
   return n;
 }
 
-// Parallel walk; collects both trees' nodes in preorder for random picks.
-bool Compare(HstTree *tree, HstNode *node, const M *m, std::vector<HstNode *> *hs,
-             std::vector<M *> *ms) {
-  hs->push_back(node);
+// The model in the tree's Dump format, and both trees' nodes in preorder.
+void MDump(const M *m, std::string *out, std::vector<M *> *ms) {
   ms->push_back(const_cast<M *>(m));
-  const int32_t n = HST_GetNumChildren(tree, node);
-  if (m->key != HST_GetKey(tree, node) || m->val != HST_GetVal(tree, node) ||
-      m->svc != node->subtreeValCount || n != static_cast<int32_t>(m->kids.size())) {
-    ADD_FAILURE() << "node '" << HST_GetKey(tree, node) << "' differs from model '" << m->key
-                  << "': val " << HST_GetVal(tree, node) << "/" << m->val << " count "
-                  << node->subtreeValCount << "/" << m->svc << " children " << n << "/"
-                  << m->kids.size();
-    return false;
-  }
-  EsaArray kids = hst_test::ChildArray(tree, node);
-  for (int32_t i = 0; i < n; i++) {
-    HstNode *child = HST_GetChild(tree, node, i);
-    if (!child || HST_GetParent(tree, child) != node ||
-        std::strcmp(ESA_GetKey(&kids, i), HST_GetKey(tree, child)) != 0) {
-      ADD_FAILURE() << "bad child link under '" << m->key << "' at " << i;
-      return false;
-    }
-    if (!Compare(tree, child, m->kids[i].get(), hs, ms)) return false;
-  }
-  return true;
+  *out += "(" + m->key + "=" + std::to_string(m->val) + "#" + std::to_string(m->svc);
+  for (const auto &kid : m->kids) MDump(kid.get(), out, ms);
+  *out += ")";
+}
+void Preorder(HstTree *tree, HstNode *node, std::vector<HstNode *> *hs) {
+  hs->push_back(node);
+  for (int32_t i = 0; i < HST_GetNumChildren(tree, node); i++)
+    Preorder(tree, HST_GetChild(tree, node, i), hs);
 }
 
-class Random {
- public:
-  explicit Random(unsigned seed) : gen_(seed) {}
-  int Below(int n) { return std::uniform_int_distribution<int>(0, n - 1)(gen_); }
-  bool Chance(int percent) { return Below(100) < percent; }
-
- private:
-  std::mt19937 gen_;
-};
-
-const char *const kNames[] = {"", "a", "b", "ab", "B", "\xc3\xa9", "zz"};
-
-std::string RandomName(Random *rnd) { return kNames[rnd->Below(7)]; }
-
-std::string RandomPath(Random *rnd, char sep) {
-  std::string path(1, rnd->Chance(80) ? sep : 'x');  // the first character is not examined
-  int depth = rnd->Below(5);
-  for (int i = 0; i < depth; i++) {
-    if (i > 0) path += sep;
-    path += RandomName(rnd);
-  }
-  if (depth > 0 && rnd->Chance(15)) path += sep;
-  return path;
-}
-
-struct Run {
-  TestPool tp;
-  HstTree *tree = nullptr;
+struct Runner {
+  coffer_test::TestPool tp;
+  HstTree *tree;
   M root;
   char sep;
-  bool mpCallback;
+  bool mp;
+  std::mt19937 gen;
   CofferVal nextVal = 1;
-  std::vector<CofferVal> expected;  // releases the model predicts for this step
+  V expected;  // releases the model predicts for this step
   std::vector<HstNode *> hs;
   std::vector<M *> ms;
 
-  Run(char separator, bool mp) : sep(separator), mpCallback(mp) {
+  Runner(char separator, bool mpCallback, unsigned seed)
+      : sep(separator), mp(mpCallback), gen(seed) {
     tree = HST_AllocTreeEx(tp.pool(), sep, kDefault, 1, 2);
     if (mp)
       HST_SetMpFreeValFn(tree, coffer_test::RecordMpRelease);
     else
       HST_SetFreeValFn(tree, coffer_test::RecordRelease);
-    root.val = kDefault;
   }
-
-  int32_t ModelSize() { return static_cast<int32_t>(ms.size()); }
+  int Below(int n) { return std::uniform_int_distribution<int>(0, n - 1)(gen); }
+  bool Chance(int percent) { return Below(100) < percent; }
+  std::string Name() {
+    static const char *const kNames[] = {"", "a", "b", "ab", "B", "\xc3\xa9", "zz"};
+    return kNames[Below(7)];
+  }
+  std::string Path() {
+    std::string path(1, Chance(80) ? sep : 'x');  // the first character is not examined
+    for (int i = 0, depth = Below(5); i < depth; i++)
+      path += (i ? std::string(1, sep) : "") + Name();
+    if (path.size() > 1 && Chance(15)) path += sep;
+    return path;
+  }
 
   void Sync(const std::string &step) {
     hs.clear();
     ms.clear();
-    ASSERT_TRUE(Compare(tree, HST_GetRoot(tree), &root, &hs, &ms)) << step;
-    ASSERT_EQ(HST_GetSize(tree), ModelSize()) << step;
+    std::string body;
+    MDump(&root, &body, &ms);
+    ASSERT_EQ(Dump(tree), "size " + std::to_string(ms.size()) + " " + body) << step;
+    CheckTree(tree);
+    Preorder(tree, HST_GetRoot(tree), &hs);
     ASSERT_EQ(Released(), expected) << step;
-    for (MemPool *p : ReleasedPools()) ASSERT_EQ(p, mpCallback ? &tree->mp : nullptr) << step;
-    Released().clear();
-    ReleasedPools().clear();
+    ASSERT_EQ(ReleasedPools(), std::vector<MemPool *>(expected.size(), mp ? &tree->mp : nullptr));
+    ResetLogs();
     expected.clear();
   }
 
-  std::string Step(Random *rnd) {
-    const int pick = rnd->Below(100);
-    const int at = rnd->Below(ModelSize());
+  std::string Step() {
+    const int pick = Below(100), at = Below(static_cast<int>(ms.size()));
     HstNode *hnode = hs[at];
     M *mnode = ms[at];
-    const bool big = ModelSize() > 250;
+    const bool big = ms.size() > 250;
     if (pick < 30 && !big) {
-      std::string path = RandomPath(rnd, sep);
-      CofferVal val = rnd->Chance(10) ? kDefault : nextVal++;
-      const std::string before = path;
+      std::string path = Path();
+      CofferVal val = Chance(10) ? kDefault : nextVal++;
       HstNode *got = HST_Insert(tree, path.c_str(), val);
-      EXPECT_EQ(path, before);
       M *want = MWalk(&root, path, sep, true);
       want->val = val;
-      EXPECT_NE(got, nullptr);
-      if (got) {
-        EXPECT_EQ(HST_GetKey(tree, got), want->key);
-      }
+      EXPECT_TRUE(got && HST_GetKey(tree, got) == want->key);
       return "insert " + path;
     }
     if (pick < 38 && !big) {
-      std::string key = rnd->Chance(20) ? std::string("x") + sep + "y" : RandomName(rnd);
-      CofferVal val = nextVal++;
-      EXPECT_NE(HST_InsertChild(tree, hnode, key.c_str(), val), nullptr);
-      MInsertChild(mnode, key, val);
+      std::string key = Chance(20) ? std::string("x") + sep + "y" : Name();
+      EXPECT_NE(HST_InsertChild(tree, hnode, key.c_str(), nextVal), nullptr);
+      MInsertChild(mnode, key, nextVal++);
       return "insert child " + key + " under " + mnode->key;
     }
     if (pick < 48) {
-      std::string path = RandomPath(rnd, sep);
+      std::string path = Path();
       HstNode *got = HST_Find(tree, path.c_str());
       M *want = MWalk(&root, path, sep, false);
-      EXPECT_EQ(got == nullptr, want == nullptr) << path;
       // Both trees are in step, so the preorder positions must match.
-      if (got && want) {
-        auto h = std::find(hs.begin(), hs.end(), got) - hs.begin();
-        auto m = std::find(ms.begin(), ms.end(), want) - ms.begin();
-        EXPECT_EQ(h, m) << path;
-      }
+      EXPECT_EQ(std::find(hs.begin(), hs.end(), got) - hs.begin(),
+                std::find(ms.begin(), ms.end(), want) - ms.begin())
+          << path;
       return "find " + path;
     }
     if (pick < 56 || big) {
       HST_RemoveSubtree(tree, hnode);
-      if (mnode == &root) {
-        MClear(&root, &expected);
-      } else {
-        MRelease(mnode, &expected);
-        auto &sibs = mnode->parent->kids;
-        sibs.erase(std::find_if(sibs.begin(), sibs.end(),
-                                [&](const std::unique_ptr<M> &k) { return k.get() == mnode; }));
-      }
+      if (mnode == &root) return MClear(&root, &expected), "remove root";
+      MRelease(mnode, &expected);
+      auto &sibs = mnode->parent->kids;
+      sibs.erase(std::find_if(sibs.begin(), sibs.end(),
+                              [&](const std::unique_ptr<M> &k) { return k.get() == mnode; }));
       return "remove " + std::to_string(at);
     }
     if (pick < 71) {
-      const int dst = rnd->Below(ModelSize());
-      std::string newKey = RandomName(rnd);
-      const bool renamed = rnd->Chance(50);
+      const int dst = Below(static_cast<int>(ms.size()));
+      std::string newKey = Name();
+      const bool renamed = Chance(50);
       const int32_t vals = MCountVals(mnode);
-      hst_test::ResetLogs();
-      const bool fail = vals > 0 && rnd->Chance(25);
-      if (fail) Script().failAt = rnd->Below(vals);
-      HstNode *got = HST_CloneSubtree(tree, hnode, hst_test::ScriptedClone,
-                                      renamed ? newKey.c_str() : nullptr, hs[dst]);
+      const bool fail = vals > 0 && Chance(25);
+      if (fail) Script().failAt = Below(vals);
+      HstNode *got =
+          HST_CloneSubtree(tree, hnode, ScriptedClone, renamed ? newKey.c_str() : nullptr, hs[dst]);
       EXPECT_EQ(Script().calls, fail ? Script().failAt + 1 : vals);
+      EXPECT_EQ(got == nullptr, fail);
       if (fail) {
-        EXPECT_EQ(got, nullptr);
-        // Everything copied so far goes back, each value once; defaultVal
-        // goes once for every copied node that held it.
-        std::vector<CofferVal> made, back;
-        for (auto &c : Script().made) made.push_back(c.second);
-        for (CofferVal v : Released())
-          if (v != kDefault) back.push_back(v);
-        std::sort(made.begin(), made.end());
-        std::sort(back.begin(), back.end());
-        EXPECT_EQ(back, made);
-        Released().clear();
-        ReleasedPools().clear();
+        ExpectCopiesReleased();  // and defaultVal once per copied node holding it
+        ResetLogs();
         return "failed clone";
       }
-      EXPECT_NE(got, nullptr);
       size_t used = 0;
       auto copy = MCopy(mnode, &used);
       EXPECT_EQ(used, Script().made.size());
@@ -299,53 +219,36 @@ struct Run {
       MAttach(ms[dst], std::move(copy));
       return "clone " + std::to_string(at) + " under " + std::to_string(dst);
     }
-    if (pick < 72) {
-      HST_Clear(tree);
-      MClear(&root, &expected);
-      return "clear";
-    }
+    if (pick < 72) return HST_Clear(tree), MClear(&root, &expected), "clear";
     if (pick < 86) {
-      CofferVal val = nextVal++;
-      HST_SetVal(tree, hnode, val);
-      mnode->val = val;
+      HST_SetVal(tree, hnode, nextVal);
+      mnode->val = nextVal++;
       return "set";
     }
-    const int32_t delta = rnd->Below(7) - 3;
+    const int32_t delta = Below(7) - 3;
     HSTAAAdjustSubtreeValCount(tree, hnode, delta);
-    if (delta)
-      for (M *m = mnode; m; m = m->parent) m->svc += delta;
+    for (M *m = mnode; m; m = m->parent) m->svc += delta;
     return "adjust";
   }
 };
 
-void RunSeed(unsigned seed, char sep, bool mp) {
-  hst_test::ResetLogs();
-  Random rnd(seed);
-  Run run(sep, mp);
-  ASSERT_NE(run.tree, nullptr);
-  run.Sync("start");
-  for (int i = 0; i < 2500; i++) {
-    std::string step = run.Step(&rnd);
-    run.Sync("step " + std::to_string(i) + ": " + step);
-    if (::testing::Test::HasFailure()) return;
-  }
-  HST_FreeTree(run.tree);
-  MClear(&run.root, &run.expected);
-  EXPECT_EQ(Released(), run.expected);
-  EXPECT_EQ(run.tp.liveBlocks(), 0u);
-}
-
-TEST(HstModel, RandomSlashSeparatorFreeValFn) {
-  for (unsigned seed = 1; seed <= 4; seed++) {
+TEST(HstModel, RandomOperationsMatchTheModel) {
+  // Two separators (the other one an ordinary name character) and both kinds
+  // of release callback.
+  for (unsigned seed = 1; seed <= 8; seed++) {
     SCOPED_TRACE(seed);
-    RunSeed(seed, '/', false);
-  }
-}
-
-TEST(HstModel, RandomDotSeparatorMpFreeValFn) {
-  for (unsigned seed = 11; seed <= 14; seed++) {
-    SCOPED_TRACE(seed);
-    RunSeed(seed, '.', true);
+    ResetLogs();
+    Runner run(seed <= 4 ? '/' : '.', seed > 4, seed);
+    run.Sync("start");
+    for (int i = 0; i < 2500 && !HasFailure(); i++) {
+      std::string step = run.Step();
+      run.Sync("step " + std::to_string(i) + ": " + step);
+    }
+    if (HasFailure()) return;
+    HST_FreeTree(run.tree);
+    MClear(&run.root, &run.expected);
+    EXPECT_EQ(Released(), run.expected);
+    EXPECT_EQ(run.tp.liveBlocks(), 0u);
   }
 }
 
