@@ -13,8 +13,10 @@
 
 namespace coffer_test {
 
-// A 4-byte aligned heap region of exactly the requested size (rounded up to
-// whole words), filled with a marker byte so that stale bytes show.
+constexpr uint32_t kNone = SH_NO_BLOCK;
+
+// A 4-byte aligned region of the requested size, filled with a marker byte
+// so that stale bytes show.
 class Region {
  public:
   explicit Region(uint32_t size, uint8_t fill = 0xA5) : words_((size + 3) / 4), size_(size) {
@@ -22,14 +24,13 @@ class Region {
   }
   void *base() { return words_.data(); }
   char *bytes() { return reinterpret_cast<char *>(words_.data()); }
-  uint32_t size() const { return size_; }
   ShRegionHeader *head() { return reinterpret_cast<ShRegionHeader *>(words_.data()); }
   ShBlockHeader *block(uint32_t off) { return reinterpret_cast<ShBlockHeader *>(bytes() + off); }
-  // Region offset of a payload address (block offset + 16); 0 for null.
+  void *at(uint32_t off) { return bytes() + off; }
+  // Region offset of an address; 0 for null.
   uint32_t off(const void *p) {
     return p ? static_cast<uint32_t>(static_cast<const char *>(p) - bytes()) : 0;
   }
-  void *at(uint32_t off) { return bytes() + off; }
   std::vector<char> Snapshot() { return std::vector<char>(bytes(), bytes() + size_); }
 
  private:
@@ -48,24 +49,21 @@ inline ::testing::AssertionResult HeapSound(const void *region,
 inline void ExpectBlock(Region &r, uint32_t off, uint32_t size, uint32_t prevSize, uint32_t next,
                         uint32_t prev) {
   const ShBlockHeader *b = r.block(off);
-  EXPECT_EQ(b->blockSize, size) << "blockSize at " << off;
-  EXPECT_EQ(b->prevBlockSize, prevSize) << "prevBlockSize at " << off;
-  EXPECT_EQ(b->nextFree, next) << "nextFree at " << off;
-  EXPECT_EQ(b->prevFree, prev) << "prevFree at " << off;
+  EXPECT_EQ((std::vector<uint32_t>{b->blockSize, b->prevBlockSize, b->nextFree, b->prevFree}),
+            (std::vector<uint32_t>{size, prevSize, next, prev}))
+      << "block at " << off;
 }
 
-// Deterministic payload contents, so a block's bytes identify its owner.
+// Deterministic contents, so a block's bytes identify its owner.
 inline uint8_t PatternByte(uint32_t tag, uint32_t i) {
   return static_cast<uint8_t>((tag * 2654435761u + i * 131u) >> 7);
 }
 inline void FillPattern(void *p, uint32_t size, uint32_t tag) {
-  auto *b = static_cast<uint8_t *>(p);
-  for (uint32_t i = 0; i < size; ++i) b[i] = PatternByte(tag, i);
+  for (uint32_t i = 0; i < size; ++i) static_cast<uint8_t *>(p)[i] = PatternByte(tag, i);
 }
 inline bool HasPattern(const void *p, uint32_t size, uint32_t tag) {
-  auto *b = static_cast<const uint8_t *>(p);
   for (uint32_t i = 0; i < size; ++i)
-    if (b[i] != PatternByte(tag, i)) return false;
+    if (static_cast<const uint8_t *>(p)[i] != PatternByte(tag, i)) return false;
   return true;
 }
 
