@@ -180,6 +180,8 @@ HstNode *HSTAAInsert(HstaaTree *tree, HstNode *node, char *path, CofferVal val) 
       key = cut + 1;
     }
   }
+  // out starts as the current value, so a callback that accepts without
+  // writing it leaves the value as it was.
   CofferVal cur = HST_GetVal(h, node);
   CofferVal out = cur;
   if (tree->insertValFn(tree, cur, val, &out)) {

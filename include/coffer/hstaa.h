@@ -14,7 +14,8 @@ extern "C" {
 typedef struct HstaaTree HstaaTree;
 
 /* Merges (insertion) or takes out (removal) operand from a node's value cur:
- * on true the node's new value is in *out; on false the node is left alone. */
+ * on true the node's new value is in *out (which starts as cur, so accepting
+ * without writing keeps the value); on false the node is left alone. */
 typedef bool (*HstaaValFn)(HstaaTree *tree, CofferVal cur, CofferVal operand,
                            CofferVal *out);
 

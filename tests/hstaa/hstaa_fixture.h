@@ -1,6 +1,6 @@
-// An associative-array tree for tests: the handle, configurable value
-// callbacks that count their calls, a per-tree release log, and readers that
-// dump the whole tree and check its structure and value counts.
+// An associative-array tree for tests: value callbacks driven by a small rule
+// set that log every call and every release in order, and readers that dump
+// the tree and check its links, key order and value counts.
 #ifndef COFFER_TESTS_HSTAA_FIXTURE_H
 #define COFFER_TESTS_HSTAA_FIXTURE_H
 
@@ -9,146 +9,123 @@
 
 #include <cstring>
 #include <set>
+#include <sstream>
 #include <string>
 #include <vector>
 
 namespace hstaa_test {
 
-// What the value callbacks do. Operands and node values are small numbers.
+// Counting: insert gives cur + 1, remove cur - 1 (refused at 0), so a node's
+// value is the number of values it holds. Otherwise insert replaces by the
+// operand and remove accepts only the value held, leaving 0.
 struct Behaviour {
-  enum Insert { kReplace, kIncrement };  // out = operand; out = cur + 1
-  enum Remove { kIfEqual, kDecrement };  // cur == operand -> 0; cur > 0 -> cur - 1
-  Insert insert = kReplace;
-  Remove remove = kIfEqual;
-  std::set<CofferVal> refuseOperands;  // insertValFn refuses these operands
-  std::set<CofferVal> refuseCurrent;   // ... and nodes holding these values
-  std::set<CofferVal> refuseClone;     // cloneValFn refuses these values
+  bool counting = false;
+  std::set<CofferVal> refuseOperands, refuseCurrent, refuseClone;
 };
 
-// Pure forms of the callbacks, shared with the reference model.
-inline bool InsertRule(const Behaviour &b, CofferVal cur, CofferVal op, CofferVal *out) {
-  if (b.refuseOperands.count(op) || b.refuseCurrent.count(cur)) return false;
-  *out = b.insert == Behaviour::kReplace ? op : cur + 1;
-  return true;
-}
-inline bool RemoveRule(const Behaviour &b, CofferVal cur, CofferVal op, CofferVal *out) {
-  if (b.remove == Behaviour::kIfEqual) {
-    if (cur != op) return false;
-    *out = 0;
-    return true;
+// One callback: I(nsert) and R(emove) of op at cur, C(lone) of cur. Logged as
+// "I<cur>,<op>", "R<cur>,<op>", "C<cur>"; a release as "F<value>".
+inline bool Apply(const Behaviour &b, char what, CofferVal cur, CofferVal op, CofferVal *out,
+                  std::vector<std::string> *log) {
+  log->push_back(what + std::to_string(cur) + (what == 'C' ? "" : "," + std::to_string(op)));
+  if (what == 'C') {
+    if (b.refuseClone.count(cur)) return false;
+    *out = cur;
+  } else if (what == 'R') {
+    if (b.counting ? cur == 0 : cur != op) return false;
+    *out = b.counting ? cur - 1 : 0;
+  } else {
+    if (b.refuseOperands.count(op) || b.refuseCurrent.count(cur)) return false;
+    *out = b.counting ? cur + 1 : op;
   }
-  if (cur == 0) return false;
-  *out = cur - 1;
-  return true;
-}
-inline bool CloneRule(const Behaviour &b, CofferVal val, CofferVal *out) {
-  if (b.refuseClone.count(val)) return false;
-  *out = val;
   return true;
 }
 
 struct TestTree {
   HstaaTree t;  // first: the callbacks find the TestTree from the handle
   Behaviour behaviour;
-  long insertCalls = 0, removeCalls = 0, cloneCalls = 0;
-  std::vector<CofferVal> released;
+  std::vector<std::string> log;
 
-  explicit TestTree(MemPool *pool, CofferVal defaultVal = 0, char sep = '/', int32_t cap = 2,
-                    int32_t inc = 2) {
+  explicit TestTree(MemPool *pool, CofferVal defaultVal = 0, char sep = '/', int32_t cap = 2) {
     std::memset(&t, 0, sizeof t);
     t.hst.mp = *pool;
-    t.hst.ownsHandle = false;
-    t.cloneValFn = Clone;
-    t.insertValFn = Insert;
-    t.removeValFn = Remove;
-    HST_SetMpFreeValFn(&t.hst, Release);
-    ok = HST_CreateTreeData(&t.hst, sep, defaultVal, cap, inc);
+    t.cloneValFn = [](HstTree *h, CofferVal v, CofferVal *out) {
+      return Of(h)->Call('C', v, 0, out);
+    };
+    t.insertValFn = [](HstaaTree *h, CofferVal cur, CofferVal op, CofferVal *out) {
+      EXPECT_EQ(*out, cur);  // handed the node's current value
+      return Of(h)->Call('I', cur, op, out);
+    };
+    t.removeValFn = [](HstaaTree *h, CofferVal cur, CofferVal op, CofferVal *out) {
+      EXPECT_EQ(*out, cur);
+      return Of(h)->Call('R', cur, op, out);
+    };
+    HST_SetMpFreeValFn(&t.hst, [](MemPool *p, CofferVal v) {
+      Of(p)->log.push_back("F" + std::to_string(v));
+    });
+    EXPECT_TRUE(HST_CreateTreeData(&t.hst, sep, defaultVal, cap, 2));
   }
-  ~TestTree() {
-    if (t.hst.data) HST_FreeTree(&t.hst);
-  }
-  TestTree(const TestTree &) = delete;
-  TestTree &operator=(const TestTree &) = delete;
+  ~TestTree() { HST_FreeTree(&t.hst); }
 
-  bool ok = false;
+  static TestTree *Of(void *handle) { return reinterpret_cast<TestTree *>(handle); }
+  bool Call(char what, CofferVal cur, CofferVal op, CofferVal *out) {
+    return Apply(behaviour, what, cur, op, out, &log);
+  }
   HstTree *h() { return &t.hst; }
   HstNode *root() { return HST_GetRoot(&t.hst); }
   HstNode *Find(const char *path) { return HST_Find(&t.hst, path); }
-  // Count of the node at path, or -1 when there is no such node.
-  int32_t Count(const char *path) {
-    HstNode *n = Find(path);
-    return n ? HSTAA_GetSubtreeValCount(&t, n) : -1;
-  }
-  CofferVal Val(const char *path) { return HST_GetVal(&t.hst, Find(path)); }
-  void ResetCalls() {
-    insertCalls = removeCalls = cloneCalls = 0;
-    released.clear();
-  }
-
-  static TestTree *Of(void *handle) { return reinterpret_cast<TestTree *>(handle); }
-  static bool Insert(HstaaTree *tree, CofferVal cur, CofferVal op, CofferVal *out) {
-    TestTree *tt = Of(tree);
-    tt->insertCalls++;
-    return InsertRule(tt->behaviour, cur, op, out);
-  }
-  static bool Remove(HstaaTree *tree, CofferVal cur, CofferVal op, CofferVal *out) {
-    TestTree *tt = Of(tree);
-    tt->removeCalls++;
-    return RemoveRule(tt->behaviour, cur, op, out);
-  }
-  static bool Clone(HstTree *tree, CofferVal val, CofferVal *out) {
-    TestTree *tt = Of(tree);
-    tt->cloneCalls++;
-    return CloneRule(tt->behaviour, val, out);
-  }
-  static void Release(MemPool *pool, CofferVal val) { Of(pool)->released.push_back(val); }
 };
 
-// One line per node in preorder (children in key order): depth, key, value
-// and count. Keys are bracketed so empty keys and spaces show.
-inline void DumpNode(HstaaTree *t, HstNode *n, int depth, std::string *out) {
-  *out += std::string(2 * depth, ' ') + "[" + HST_GetKey(&t->hst, n) + "] " +
-          std::to_string(HST_GetVal(&t->hst, n)) + " #" +
-          std::to_string(HSTAA_GetSubtreeValCount(t, n)) + "\n";
-  for (int32_t i = 0; i < HST_GetNumChildren(&t->hst, n); i++)
-    DumpNode(t, HST_GetChild(&t->hst, n, i), depth + 1, out);
+// Checks written as "path=value:count", "path:count" or "path!" (no node).
+inline void Expect(TestTree *tt, const std::string &checks) {
+  std::istringstream in(checks);
+  for (std::string tok; in >> tok;) {
+    SCOPED_TRACE(tok);
+    const size_t colon = tok.rfind(':'), eq = tok.find('=');
+    HstNode *n = tt->Find(tok.substr(0, std::min({eq, colon, tok.size() - 1})).c_str());
+    if (tok.back() == '!') {
+      EXPECT_EQ(n, nullptr);
+      continue;
+    }
+    ASSERT_NE(n, nullptr);
+    EXPECT_EQ(HSTAA_GetSubtreeValCount(&tt->t, n), std::stoi(tok.substr(colon + 1)));
+    if (eq != std::string::npos) {
+      EXPECT_EQ(HST_GetVal(tt->h(), n), std::stoul(tok.substr(eq + 1)));
+    }
+  }
 }
-inline std::string Dump(HstaaTree *t) {
-  std::string s;
-  DumpNode(t, HST_GetRoot(&t->hst), 0, &s);
+
+// One line per node in preorder (children in key order): key, value, count.
+inline std::string Dump(HstaaTree *t, HstNode *n = nullptr, int depth = 0) {
+  if (!n) n = HST_GetRoot(&t->hst);
+  std::string s = std::string(2 * depth, ' ') + "[" + HST_GetKey(&t->hst, n) + "] " +
+                  std::to_string(HST_GetVal(&t->hst, n)) + " #" +
+                  std::to_string(HSTAA_GetSubtreeValCount(t, n)) + "\n";
+  for (int32_t i = 0; i < HST_GetNumChildren(&t->hst, n); i++)
+    s += Dump(t, HST_GetChild(&t->hst, n, i), depth + 1);
   return s;
 }
 
-// Checks parent links, strictly ascending sibling keys and, when the values
-// themselves count what a node holds (the kIncrement/kDecrement callbacks),
-// that every count is the node's value plus its children's counts. Returns
-// the number of nodes in the subtree.
-inline int32_t CheckNode(HstaaTree *t, HstNode *n, bool valueIsHeld) {
+// Parent links, strictly ascending sibling keys, and every count at least the
+// sum of its children's (exactly the node's own value plus that sum when the
+// values count what a node holds). Returns the number of nodes.
+inline int32_t CheckNode(HstaaTree *t, HstNode *n, bool counting) {
   HstTree *h = &t->hst;
-  int32_t nodes = 1;
-  int64_t sum = 0;
-  const int32_t kids = HST_GetNumChildren(h, n);
-  for (int32_t i = 0; i < kids; i++) {
+  int32_t nodes = 1, own = HSTAA_GetSubtreeValCount(t, n);
+  for (int32_t i = 0; i < HST_GetNumChildren(h, n); i++) {
     HstNode *c = HST_GetChild(h, n, i);
-    EXPECT_EQ(HST_GetParent(h, c), n) << HST_GetKey(h, c);
-    if (i > 0) {
-      EXPECT_LT(std::strcmp(HST_GetKey(h, HST_GetChild(h, n, i - 1)), HST_GetKey(h, c)), 0);
-    }
-    EXPECT_GE(HSTAA_GetSubtreeValCount(t, c), 0) << HST_GetKey(h, c);
-    sum += HSTAA_GetSubtreeValCount(t, c);
-    nodes += CheckNode(t, c, valueIsHeld);
+    EXPECT_EQ(HST_GetParent(h, c), n);
+    const char *prev = i ? HST_GetKey(h, HST_GetChild(h, n, i - 1)) : nullptr;
+    EXPECT_TRUE(!prev || std::strcmp(prev, HST_GetKey(h, c)) < 0);
+    own -= HSTAA_GetSubtreeValCount(t, c);
+    nodes += CheckNode(t, c, counting);
   }
-  if (valueIsHeld) {
-    EXPECT_EQ(HSTAA_GetSubtreeValCount(t, n), static_cast<int64_t>(HST_GetVal(h, n)) + sum)
-        << "at [" << HST_GetKey(h, n) << "]";
-  } else {
-    EXPECT_GE(HSTAA_GetSubtreeValCount(t, n), sum) << "at [" << HST_GetKey(h, n) << "]";
-  }
+  EXPECT_GE(own, 0) << HST_GetKey(h, n);
+  EXPECT_TRUE(!counting || static_cast<CofferVal>(own) == HST_GetVal(h, n)) << HST_GetKey(h, n);
   return nodes;
 }
-inline void CheckTree(HstaaTree *t, bool valueIsHeld) {
-  int32_t nodes = CheckNode(t, HST_GetRoot(&t->hst), valueIsHeld);
-  EXPECT_EQ(nodes, HST_GetSize(&t->hst));
+inline void CheckTree(HstaaTree *t, bool counting) {
+  EXPECT_EQ(CheckNode(t, HST_GetRoot(&t->hst), counting), HST_GetSize(&t->hst));
 }
 
 }  // namespace hstaa_test
