@@ -1,6 +1,6 @@
 // Test scaffolding for the red-black trees: per-family traits, a textbook
 // red-black tree (pointer based, sentinel, successor-copy deletion) to run
-// side by side with the library, an invariant checker and a shape comparison.
+// side by side with the library, and one checker of invariants and shape.
 #ifndef COFFER_TESTS_RBT_TEST_UTIL_H
 #define COFFER_TESTS_RBT_TEST_UTIL_H
 
@@ -10,9 +10,10 @@
 
 #include <algorithm>
 #include <cstdint>
-#include <map>
+#include <deque>
 #include <random>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "mempool/pool.h"
@@ -23,12 +24,10 @@ inline RbtTreeData *DataOf(const RbtTree *t) { return static_cast<RbtTreeData *>
 inline RbtNode *NodeAt(const RbtTree *t, PoolOffset off) { return coffer::At<RbtNode>(t, off); }
 inline RbtNode *NilOf(const RbtTree *t) { return NodeAt(t, DataOf(t)->nil); }
 inline RbtNode *RootOf(const RbtTree *t) { return NodeAt(t, DataOf(t)->root); }
+inline CofferVal ValOr0(const RbtNode *n) { return n ? n->val : 0; }
 
-// ---- family traits ----------------------------------------------------------
-// Each family's calls under one set of names, its key type for the model, an
-// order written independently of the library's, and a key generator that
-// yields many equal keys.
-
+// Each family's calls under one set of names, its key type, an order written
+// independently of the library's, and keys with many repeats.
 #define RBT_TEST_FAMILY_CALLS(P, KEYARG)                                                         \
   static RbtTree *AllocEx(MemPool *p) { return P##_AllocTreeEx(p); }                             \
   static RbtTree *AllocWithNil(MemPool *p, RbtNode *n) { return P##_AllocTreeWithNil(p, n); }    \
@@ -66,25 +65,19 @@ struct StringFamily {
   static constexpr bool kCopiesKey = true;
   RBT_TEST_FAMILY_CALLS(RBT, RBT_TEST_STR_ARG)
   static Key KeyOf(const RbtTree *t, const RbtNode *n) { return coffer::At<char>(t, n->key); }
+  static Key MakeKey(int i) { return std::string(1, static_cast<char>('a' + i)); }
   // Bytes as signed values, the terminator included as 0.
   static bool Less(const Key &a, const Key &b) {
-    std::vector<signed char> x(a.begin(), a.end()), y(b.begin(), b.end());
-    x.push_back(0);
-    y.push_back(0);
-    return std::lexicographical_compare(x.begin(), x.end(), y.begin(), y.end());
+    size_t i = 0;
+    while (a.c_str()[i] == b.c_str()[i] && a.c_str()[i]) ++i;
+    return static_cast<signed char>(a.c_str()[i]) < static_cast<signed char>(b.c_str()[i]);
   }
-  // Short keys over a, b and the high byte 0xE9 (prefixes of one another,
-  // many repeats), and keys behind a long common prefix.
+  // Short keys over a, b and the high byte 0xE9, and runs of p of any length
+  // with a tail, prefixes of one another, where the descent skips the most.
   static Key RandomKey(std::mt19937 &rng) {
-    static const char kShort[] = {'a', 'b', '\xE9'};
-    static const char kLong[] = {'x', '\x90', 'y'};
-    Key k;
-    if (rng() % 4 == 0) {
-      k = "a-rather-long-common-prefix/";
-      for (unsigned n = rng() % 3; n; --n) k += kLong[rng() % 3];
-    } else {
-      for (unsigned n = rng() % 4; n; --n) k += kShort[rng() % 3];
-    }
+    const char *tails = rng() % 4 == 0 ? "p\x90q" : "ab\xE9";
+    Key k(tails[0] == 'p' ? rng() % 40 : 0, 'p');
+    for (unsigned n = rng() % 4; n; --n) k += tails[rng() % 3];
     return k;
   }
 };
@@ -94,6 +87,7 @@ struct Int32Family {
   static constexpr bool kCopiesKey = false;
   RBT_TEST_FAMILY_CALLS(RbtInt32, RBT_TEST_INT_ARG)
   static Key KeyOf(const RbtTree *, const RbtNode *n) { return static_cast<int32_t>(n->key); }
+  static Key MakeKey(int i) { return i - 3; }
   // Serial order: a before b when b lies 1 to 2^31 steps after a.
   static bool Less(Key a, Key b) {
     uint32_t d = static_cast<uint32_t>(b) - static_cast<uint32_t>(a);
@@ -102,8 +96,7 @@ struct Int32Family {
   static Key RandomKey(std::mt19937 &rng) { return static_cast<int32_t>(rng() % 41) - 20; }
 };
 
-// Keys on both sides of the signed wrap-around, where serial order and
-// signed order disagree (INT32_MAX comes before INT32_MIN).
+// Keys across the signed wrap-around, where serial and signed order disagree.
 struct Int32WrapFamily : Int32Family {
   static Key RandomKey(std::mt19937 &rng) {
     return static_cast<int32_t>(0x7FFFFFECu + rng() % 41);
@@ -115,6 +108,7 @@ struct VoidPtrFamily {
   static constexpr bool kCopiesKey = false;
   RBT_TEST_FAMILY_CALLS(RbtVoidPtr, RBT_TEST_PTR_ARG)
   static Key KeyOf(const RbtTree *, const RbtNode *n) { return n->key; }
+  static Key MakeKey(int i) { return 0x7FFFFFFEu + i; }
   static bool Less(Key a, Key b) { return a < b; }
   static Key RandomKey(std::mt19937 &rng) {
     static const Key kEdges[] = {0, 1, 0x7FFFFFFFu, 0x80000000u, 0x80000001u, 0xFFFFFFFFu};
@@ -122,320 +116,187 @@ struct VoidPtrFamily {
   }
 };
 
-template <class Fam>
-struct KeyLess {
-  bool operator()(const typename Fam::Key &a, const typename Fam::Key &b) const {
-    return Fam::Less(a, b);
-  }
-};
-
-// ---- textbook model -----------------------------------------------------------
-// RB-INSERT with RB-INSERT-FIXUP, RB-DELETE that copies the successor's
-// contents into the removed node, RB-DELETE-FIXUP, LEFT-/RIGHT-ROTATE, on
-// heap nodes with one sentinel. Equal keys go right.
+// RB-INSERT with RB-INSERT-FIXUP, RB-DELETE copying the successor's contents
+// into the removed node, RB-DELETE-FIXUP and the rotations, on nodes with
+// one sentinel; c[0] is left, c[1] right, and each mirror pair is written once
+// over a side d. Equal keys go right.
 template <class Fam>
 class Model {
  public:
   using Key = typename Fam::Key;
   struct Node {
-    Node *p, *l, *r;
+    Node *p, *c[2];
     bool red;
     Key key;
     CofferVal val;
   };
 
-  Model() {
-    nil_ = new Node{nullptr, nullptr, nullptr, false, Key(), 0};
-    nil_->p = nil_->l = nil_->r = nil_;
-    root_ = nil_;
+  Model() : nil_(New(Node{nullptr, {nullptr, nullptr}, false, Key(), 0})), root_(nil_) {
+    nil_->p = nil_->c[0] = nil_->c[1] = nil_;
   }
-  ~Model() {
-    Destroy(root_);
-    delete nil_;
-  }
-  Model(const Model &) = delete;
-  Model &operator=(const Model &) = delete;
-
   Node *nil() const { return nil_; }
   Node *root() const { return root_; }
-  size_t size() const { return byVal_.size(); }
+  size_t size() const { return size_; }
 
   void Insert(const Key &key, CofferVal val) {
-    Node *z = new Node{nil_, nil_, nil_, true, key, val};
-    byVal_[val] = z;
-    Node *y = nil_;
-    for (Node *x = root_; x != nil_; x = Fam::Less(key, x->key) ? x->l : x->r) y = x;
+    Node *z = New(Node{nil_, {nil_, nil_}, true, key, val}), *y = nil_;
+    for (Node *x = root_; x != nil_; x = x->c[!Fam::Less(key, x->key)]) y = x;
     z->p = y;
-    if (y == nil_)
-      root_ = z;
-    else if (Fam::Less(key, y->key))
-      y->l = z;
-    else
-      y->r = z;
+    (y == nil_ ? root_ : y->c[!Fam::Less(key, y->key)]) = z;
+    ++size_;
     while (z->p->red) {
       Node *g = z->p->p;
-      if (z->p == g->l) {
-        Node *u = g->r;
-        if (u->red) {
-          z->p->red = u->red = false;
-          g->red = true;
-          z = g;
-        } else {
-          if (z == z->p->r) {
-            z = z->p;
-            RotateLeft(z);
-          }
-          z->p->red = false;
-          z->p->p->red = true;
-          RotateRight(z->p->p);
-        }
-      } else {
-        Node *u = g->l;
-        if (u->red) {
-          z->p->red = u->red = false;
-          g->red = true;
-          z = g;
-        } else {
-          if (z == z->p->l) {
-            z = z->p;
-            RotateRight(z);
-          }
-          z->p->red = false;
-          z->p->p->red = true;
-          RotateLeft(z->p->p);
-        }
+      int d = z->p == g->c[1];
+      Node *u = g->c[!d];
+      if (u->red) {
+        z->p->red = u->red = false;
+        g->red = true;
+        z = g;
+        continue;
       }
+      if (z == z->p->c[!d]) Rotate(z = z->p, d);
+      z->p->red = false;
+      z->p->p->red = true;
+      Rotate(z->p->p, !d);
     }
     root_->red = false;
   }
 
   // Removes the node that currently holds val.
   void Remove(CofferVal val) {
-    Node *z = byVal_.at(val);
-    byVal_.erase(val);
-    Node *y = (z->l == nil_ || z->r == nil_) ? z : Successor(z);
-    Node *x = y->l != nil_ ? y->l : y->r;
+    Node *z = FindVal(root_, val);
+    Node *y = (z->c[0] == nil_ || z->c[1] == nil_) ? z : Successor(z);
+    Node *x = y->c[0] != nil_ ? y->c[0] : y->c[1];
     x->p = y->p;
-    if (y->p == nil_)
-      root_ = x;
-    else if (y == y->p->l)
-      y->p->l = x;
-    else
-      y->p->r = x;
-    if (y != z) {
-      z->key = y->key;
-      z->val = y->val;
-      byVal_[z->val] = z;
-    }
+    (y->p == nil_ ? root_ : y->p->c[y == y->p->c[1]]) = x;
+    if (y != z) z->key = y->key, z->val = y->val;
     if (!y->red) DeleteFixup(x);
-    delete y;
+    --size_;
+  }
+
+  // The nodes in order (a plain walk, independent of any search).
+  std::vector<const Node *> InOrder() const {
+    std::vector<const Node *> v;
+    auto walk = [&](auto &self, const Node *x) -> void {
+      if (x == nil_) return;
+      self(self, x->c[0]);
+      v.push_back(x);
+      self(self, x->c[1]);
+    };
+    walk(walk, root_);
+    return v;
   }
 
   // The first equal node on the path from the root; nullptr if none.
   const Node *FindOnPath(const Key &key) const {
-    for (Node *x = root_; x != nil_;) {
-      if (Fam::Less(key, x->key))
-        x = x->l;
-      else if (Fam::Less(x->key, key))
-        x = x->r;
-      else
-        return x;
-    }
-    return nullptr;
+    Node *x = root_;
+    while (x != nil_ && (Fam::Less(key, x->key) || Fam::Less(x->key, key)))
+      x = x->c[!Fam::Less(key, x->key)];
+    return x == nil_ ? nullptr : x;
   }
 
  private:
-  Node *Successor(Node *x) const {
-    if (x->r != nil_) {
-      x = x->r;
-      while (x->l != nil_) x = x->l;
-      return x;
-    }
-    Node *y = x->p;
-    while (y != nil_ && x == y->r) x = y, y = y->p;
-    return y;
+  Node *FindVal(Node *x, CofferVal val) {
+    if (x == nil_ || x->val == val) return x;
+    Node *l = FindVal(x->c[0], val);
+    return l != nil_ ? l : FindVal(x->c[1], val);
   }
-
-  void RotateLeft(Node *x) {
-    Node *y = x->r;
-    x->r = y->l;
-    if (y->l != nil_) y->l->p = x;
+  Node *Successor(Node *x) const {  // only called with a right child
+    for (x = x->c[1]; x->c[0] != nil_;) x = x->c[0];
+    return x;
+  }
+  // d = 0 is LEFT-ROTATE (x's right child rises), d = 1 RIGHT-ROTATE.
+  void Rotate(Node *x, int d) {
+    Node *y = x->c[!d];
+    x->c[!d] = y->c[d];
+    if (y->c[d] != nil_) y->c[d]->p = x;
     y->p = x->p;
-    if (x->p == nil_)
-      root_ = y;
-    else if (x == x->p->l)
-      x->p->l = y;
-    else
-      x->p->r = y;
-    y->l = x;
+    (x->p == nil_ ? root_ : x->p->c[x == x->p->c[1]]) = y;
+    y->c[d] = x;
     x->p = y;
   }
-
-  void RotateRight(Node *x) {
-    Node *y = x->l;
-    x->l = y->r;
-    if (y->r != nil_) y->r->p = x;
-    y->p = x->p;
-    if (x->p == nil_)
-      root_ = y;
-    else if (x == x->p->r)
-      x->p->r = y;
-    else
-      x->p->l = y;
-    y->r = x;
-    x->p = y;
-  }
-
   void DeleteFixup(Node *x) {
     while (x != root_ && !x->red) {
-      if (x == x->p->l) {
-        Node *w = x->p->r;
-        if (w->red) {
-          w->red = false;
-          x->p->red = true;
-          RotateLeft(x->p);
-          w = x->p->r;
-        }
-        if (!w->l->red && !w->r->red) {
-          w->red = true;
-          x = x->p;
-        } else {
-          if (!w->r->red) {
-            w->l->red = false;
-            w->red = true;
-            RotateRight(w);
-            w = x->p->r;
-          }
-          w->red = x->p->red;
-          x->p->red = false;
-          w->r->red = false;
-          RotateLeft(x->p);
-          x = root_;
-        }
-      } else {
-        Node *w = x->p->l;
-        if (w->red) {
-          w->red = false;
-          x->p->red = true;
-          RotateRight(x->p);
-          w = x->p->l;
-        }
-        if (!w->r->red && !w->l->red) {
-          w->red = true;
-          x = x->p;
-        } else {
-          if (!w->l->red) {
-            w->r->red = false;
-            w->red = true;
-            RotateLeft(w);
-            w = x->p->l;
-          }
-          w->red = x->p->red;
-          x->p->red = false;
-          w->l->red = false;
-          RotateRight(x->p);
-          x = root_;
-        }
+      int d = x != x->p->c[0];
+      Node *w = x->p->c[!d];
+      if (w->red) {
+        w->red = false;
+        x->p->red = true;
+        Rotate(x->p, d);
+        w = x->p->c[!d];
       }
+      if (!w->c[0]->red && !w->c[1]->red) {
+        w->red = true;
+        x = x->p;
+        continue;
+      }
+      if (!w->c[!d]->red) {
+        w->c[d]->red = false;
+        w->red = true;
+        Rotate(w, !d);
+        w = x->p->c[!d];
+      }
+      w->red = x->p->red;
+      x->p->red = false;
+      w->c[!d]->red = false;
+      Rotate(x->p, d);
+      x = root_;
     }
     x->red = false;
   }
+  Node *New(const Node &n) { return &store_.emplace_back(n); }
 
-  void Destroy(Node *x) {
-    if (x == nil_) return;
-    Destroy(x->l);
-    Destroy(x->r);
-    delete x;
-  }
-
-  Node *nil_;
-  Node *root_;
-  std::map<CofferVal, Node *> byVal_;
+  std::deque<Node> store_;  // nodes live as long as the model
+  Node *nil_, *root_;
+  size_t size_ = 0;
 };
 
-// ---- checks on the library's tree -------------------------------------------
-
-// Red-black and search-tree invariants, parent links, size, and the sentinel
-// (left, right, colour, ownsNode, val and key as they were at creation).
-// Values are assigned in insertion order, so equal keys must show rising
-// values.
+// The sentinel as created (nilKey: the key it kept), links never 0, parent
+// links, red-black rules, key order with equal keys in insertion order (values
+// rise with insertion), size; with a model, the same shape, keys, values and
+// colours node by node.
 template <class Fam>
-void CheckInvariants(const RbtTree *t, uint32_t nilKey) {
+void CheckTree(const RbtTree *t, uint32_t nilKey, const Model<Fam> *m = nullptr) {
+  using MNode = typename Model<Fam>::Node;
   const RbtTreeData *d = DataOf(t);
   const RbtNode *nil = NilOf(t);
-  ASSERT_EQ(nil->left, d->nil);
-  ASSERT_EQ(nil->right, d->nil);
-  ASSERT_EQ(nil->color, 0);
-  ASSERT_EQ(nil->ownsNode, 1);
-  ASSERT_EQ(nil->val, 0u);
-  ASSERT_EQ(nil->key, nilKey);
-  if (d->root == d->nil) {
-    ASSERT_EQ(d->size, 0u);
-    return;
-  }
-  const RbtNode *root = RootOf(t);
-  ASSERT_EQ(root->parent, d->nil);
-  ASSERT_EQ(root->color, 0);
-
-  struct Walk {
-    const RbtTree *t;
-    PoolOffset nilOff;
-    uint32_t count = 0;
-    const RbtNode *prev = nullptr;
-    // Returns the black height, or -1 after a failure.
-    int Visit(PoolOffset off) {
-      if (off == nilOff) return 1;
-      const RbtNode *x = NodeAt(t, off);
-      if (x->color > 1) return ADD_FAILURE() << "bad colour", -1;
-      for (PoolOffset c : {x->left, x->right}) {
-        if (c == 0) return ADD_FAILURE() << "a link is 0 instead of the sentinel", -1;
-        if (c != nilOff && NodeAt(t, c)->parent != off)
-          return ADD_FAILURE() << "parent link broken", -1;
-        if (c != nilOff && x->color == 1 && NodeAt(t, c)->color == 1)
-          return ADD_FAILURE() << "red node with a red child", -1;
-      }
-      int lh = Visit(x->left);
-      if (lh < 0) return -1;
-      if (prev) {
-        auto pk = Fam::KeyOf(t, prev), xk = Fam::KeyOf(t, x);
-        if (Fam::Less(xk, pk)) return ADD_FAILURE() << "keys out of order", -1;
-        if (!Fam::Less(pk, xk) && prev->val >= x->val)
-          return ADD_FAILURE() << "equal keys out of insertion order", -1;
-      }
-      prev = x;
-      ++count;
-      int rh = Visit(x->right);
-      if (rh < 0) return -1;
-      if (lh != rh) return ADD_FAILURE() << "black heights differ", -1;
-      return lh + (x->color == 0);
+  ASSERT_EQ(std::make_tuple(nil->left, nil->right, +nil->color, +nil->ownsNode, nil->val, nil->key),
+            std::make_tuple(d->nil, d->nil, 0, 1, CofferVal{0}, nilKey));
+  ASSERT_EQ(RootOf(t)->color, 0);
+  ASSERT_TRUE(d->root == d->nil || RootOf(t)->parent == d->nil);
+  uint32_t count = 0;
+  const RbtNode *prev = nullptr;
+  // Black height of the subtree at off, -1 after a failure.
+  auto visit = [&](auto &self, PoolOffset off, const MNode *mn) -> int {
+    if (m && (off == d->nil) != (mn == m->nil())) return ADD_FAILURE() << "shape differs", -1;
+    if (off == d->nil) return 1;
+    const RbtNode *x = NodeAt(t, off);
+    if (x->color > 1) return ADD_FAILURE() << "bad colour", -1;
+    if (m && (Fam::KeyOf(t, x) != mn->key || x->val != mn->val || (x->color == 1) != mn->red))
+      return ADD_FAILURE() << "node of val " << x->val << " differs from model " << mn->val, -1;
+    for (PoolOffset c : {x->left, x->right}) {
+      if (c == 0) return ADD_FAILURE() << "a link is 0 instead of the sentinel", -1;
+      if (c != d->nil && NodeAt(t, c)->parent != off) return ADD_FAILURE() << "parent link", -1;
+      if (c != d->nil && x->color == 1 && NodeAt(t, c)->color == 1)
+        return ADD_FAILURE() << "red node with a red child", -1;
     }
-  } walk{t, d->nil};
-  ASSERT_GE(walk.Visit(d->root), 0);
-  ASSERT_EQ(walk.count, d->size);
-}
-
-// Same shape, colours, keys and values as the model, node by node.
-template <class Fam>
-void CompareShape(const RbtTree *t, const Model<Fam> &m) {
-  struct Walk {
-    const RbtTree *t;
-    const Model<Fam> &m;
-    PoolOffset nilOff;
-    bool Same(PoolOffset off, const typename Model<Fam>::Node *n) {
-      if (n == m.nil()) {
-        if (off == nilOff) return true;
-        return ADD_FAILURE() << "tree has a node where the model has none", false;
-      }
-      if (off == nilOff) return ADD_FAILURE() << "tree lacks a node the model has", false;
-      const RbtNode *x = NodeAt(t, off);
-      if (Fam::KeyOf(t, x) != n->key || x->val != n->val || (x->color == 1) != n->red)
-        return ADD_FAILURE() << "node differs: val " << x->val << " vs model " << n->val,
-               false;
-      return Same(x->left, n->l) && Same(x->right, n->r);
+    int lh = self(self, x->left, m ? mn->c[0] : nullptr);
+    if (lh < 0) return -1;
+    if (prev) {
+      auto pk = Fam::KeyOf(t, prev), xk = Fam::KeyOf(t, x);
+      if (Fam::Less(xk, pk) || (!Fam::Less(pk, xk) && prev->val >= x->val))
+        return ADD_FAILURE() << "out of order at val " << x->val, -1;
     }
-  } walk{t, m, DataOf(t)->nil};
-  ASSERT_TRUE(walk.Same(DataOf(t)->root, m.root()));
-  ASSERT_EQ(static_cast<size_t>(DataOf(t)->size), m.size());
+    prev = x;
+    ++count;
+    int rh = self(self, x->right, m ? mn->c[1] : nullptr);
+    if (rh < 0) return -1;
+    if (lh != rh) return ADD_FAILURE() << "black heights differ", -1;
+    return lh + (x->color == 0);
+  };
+  ASSERT_GE(visit(visit, d->root, m ? m->root() : nullptr), 0);
+  ASSERT_EQ(count, d->size);
+  ASSERT_EQ(count, m ? m->size() : count);
 }
 
 // Values in ascending order through First/Next.
