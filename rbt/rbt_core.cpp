@@ -89,32 +89,53 @@ inline void ReplaceChild(const RbtCtx &c, PoolOffset parent, PoolOffset old, Poo
 
 inline uint8_t ColorOf(const RbtCtx &c, PoolOffset off) { return c.N(off)->color; }
 
-}  // namespace
+// Each balancing case has a mirror image; both are written once, for the
+// side L (true: left), with the near child on that side and the far one
+// opposite.
+template <bool L>
+inline PoolOffset &Near(RbtNode *n) {
+  return L ? n->left : n->right;
+}
+template <bool L>
+inline PoolOffset &Far(RbtNode *n) {
+  return L ? n->right : n->left;
+}
 
-// Neither rotation writes the sentinel: a shared sentinel stays untouched.
-void RBTRotateLeft(const RbtCtx &c, RbtNode *x) {
-  PoolOffset xo = c.O(x), yo = x->right;
+// Lifts x's far child into x's place: Rotate<true> is the left rotation.
+// It never writes the sentinel, so a shared sentinel stays untouched.
+template <bool L>
+void Rotate(const RbtCtx &c, RbtNode *x) {
+  PoolOffset xo = c.O(x), yo = Far<L>(x);
   RbtNode *y = c.N(yo);
-  x->right = y->left;
-  if (y->left != c.nilOff) c.N(y->left)->parent = xo;
+  Far<L>(x) = Near<L>(y);
+  if (Near<L>(y) != c.nilOff) c.N(Near<L>(y))->parent = xo;
   y->parent = x->parent;
   ReplaceChild(c, x->parent, xo, yo);
-  y->left = xo;
+  Near<L>(y) = xo;
   x->parent = yo;
 }
 
-void RBTRotateRight(const RbtCtx &c, RbtNode *x) {
-  PoolOffset xo = c.O(x), yo = x->left;
-  RbtNode *y = c.N(yo);
-  x->left = y->right;
-  if (y->right != c.nilOff) c.N(y->right)->parent = xo;
-  y->parent = x->parent;
-  ReplaceChild(c, x->parent, xo, yo);
-  y->right = xo;
-  x->parent = yo;
+// One step of the insertion fix-up for a red z whose red parent p is the
+// child on side L of g. Returns the node to go on from.
+template <bool L>
+RbtNode *InsertStep(const RbtCtx &c, RbtNode *z, RbtNode *p, RbtNode *g) {
+  RbtNode *u = c.N(Far<L>(g));
+  if (u->color == kRbtRed) {
+    p->color = kRbtBlack;
+    u->color = kRbtBlack;
+    g->color = kRbtRed;
+    return g;
+  }
+  if (Far<L>(p) == c.O(z)) {
+    z = p;
+    Rotate<L>(c, z);
+    p = c.N(z->parent);
+  }
+  p->color = kRbtBlack;
+  g->color = kRbtRed;
+  Rotate<!L>(c, g);
+  return z;
 }
-
-namespace {
 
 void InsertFixup(const RbtCtx &c, RbtNode *z) {
   for (;;) {
@@ -122,43 +143,39 @@ void InsertFixup(const RbtCtx &c, RbtNode *z) {
     RbtNode *p = c.N(po);  // the sentinel (black) above the root ends the loop
     if (p->color != kRbtRed) break;
     RbtNode *g = c.N(p->parent);  // exists: a red parent is never the root
-    if (g->left == po) {
-      RbtNode *u = c.N(g->right);
-      if (u->color == kRbtRed) {
-        p->color = kRbtBlack;
-        u->color = kRbtBlack;
-        g->color = kRbtRed;
-        z = g;
-        continue;
-      }
-      if (p->right == c.O(z)) {
-        z = p;
-        RBTRotateLeft(c, z);
-        p = c.N(z->parent);
-      }
-      p->color = kRbtBlack;
-      g->color = kRbtRed;
-      RBTRotateRight(c, g);
-    } else {
-      RbtNode *u = c.N(g->left);
-      if (u->color == kRbtRed) {
-        p->color = kRbtBlack;
-        u->color = kRbtBlack;
-        g->color = kRbtRed;
-        z = g;
-        continue;
-      }
-      if (p->left == c.O(z)) {
-        z = p;
-        RBTRotateRight(c, z);
-        p = c.N(z->parent);
-      }
-      p->color = kRbtBlack;
-      g->color = kRbtRed;
-      RBTRotateLeft(c, g);
-    }
+    z = g->left == po ? InsertStep<true>(c, z, p, g) : InsertStep<false>(c, z, p, g);
   }
   c.N(c.d->root)->color = kRbtBlack;
+}
+
+// One step of the removal fix-up for a doubly black x that is the child on
+// side L of p. Returns the offset of the node to go on from: p to climb, the
+// root once the extra black has been absorbed.
+template <bool L>
+PoolOffset DeleteStep(const RbtCtx &c, PoolOffset po) {
+  RbtNode *p = c.N(po);
+  RbtNode *w = c.N(Far<L>(p));
+  if (w->color == kRbtRed) {
+    w->color = kRbtBlack;
+    p->color = kRbtRed;
+    Rotate<L>(c, p);
+    w = c.N(Far<L>(p));
+  }
+  if (ColorOf(c, w->left) == kRbtBlack && ColorOf(c, w->right) == kRbtBlack) {
+    w->color = kRbtRed;
+    return po;
+  }
+  if (ColorOf(c, Far<L>(w)) == kRbtBlack) {
+    c.N(Near<L>(w))->color = kRbtBlack;
+    w->color = kRbtRed;
+    Rotate<!L>(c, w);
+    w = c.N(Far<L>(p));
+  }
+  w->color = p->color;
+  p->color = kRbtBlack;
+  c.N(Far<L>(w))->color = kRbtBlack;
+  Rotate<L>(c, p);
+  return c.d->root;
 }
 
 // x may be the sentinel; its parent field was set by the caller for this.
@@ -166,57 +183,7 @@ void DeleteFixup(const RbtCtx &c, PoolOffset xo) {
   RbtNode *x = c.N(xo);
   while (xo != c.d->root && x->color == kRbtBlack) {
     PoolOffset po = x->parent;
-    RbtNode *p = c.N(po);
-    if (p->left == xo) {
-      RbtNode *w = c.N(p->right);
-      if (w->color == kRbtRed) {
-        w->color = kRbtBlack;
-        p->color = kRbtRed;
-        RBTRotateLeft(c, p);
-        w = c.N(p->right);
-      }
-      if (ColorOf(c, w->left) == kRbtBlack && ColorOf(c, w->right) == kRbtBlack) {
-        w->color = kRbtRed;
-        xo = po;
-        x = p;
-        continue;
-      }
-      if (ColorOf(c, w->right) == kRbtBlack) {
-        c.N(w->left)->color = kRbtBlack;
-        w->color = kRbtRed;
-        RBTRotateRight(c, w);
-        w = c.N(p->right);
-      }
-      w->color = p->color;
-      p->color = kRbtBlack;
-      c.N(w->right)->color = kRbtBlack;
-      RBTRotateLeft(c, p);
-    } else {
-      RbtNode *w = c.N(p->left);
-      if (w->color == kRbtRed) {
-        w->color = kRbtBlack;
-        p->color = kRbtRed;
-        RBTRotateRight(c, p);
-        w = c.N(p->left);
-      }
-      if (ColorOf(c, w->left) == kRbtBlack && ColorOf(c, w->right) == kRbtBlack) {
-        w->color = kRbtRed;
-        xo = po;
-        x = p;
-        continue;
-      }
-      if (ColorOf(c, w->left) == kRbtBlack) {
-        c.N(w->right)->color = kRbtBlack;
-        w->color = kRbtRed;
-        RBTRotateLeft(c, w);
-        w = c.N(p->left);
-      }
-      w->color = p->color;
-      p->color = kRbtBlack;
-      c.N(w->left)->color = kRbtBlack;
-      RBTRotateRight(c, p);
-    }
-    xo = c.d->root;
+    xo = c.N(po)->left == xo ? DeleteStep<true>(c, po) : DeleteStep<false>(c, po);
     x = c.N(xo);
   }
   // Never recolours the sentinel: it is black already, and a caller's
@@ -225,6 +192,9 @@ void DeleteFixup(const RbtCtx &c, PoolOffset xo) {
 }
 
 }  // namespace
+
+void RBTRotateLeft(const RbtCtx &c, RbtNode *x) { Rotate<true>(c, x); }
+void RBTRotateRight(const RbtCtx &c, RbtNode *x) { Rotate<false>(c, x); }
 
 void RBTAttach(const RbtCtx &c, RbtNode *z, RbtNode *parent, bool left) {
   PoolOffset zo = c.O(z);
