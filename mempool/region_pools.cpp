@@ -76,13 +76,8 @@ void MemPoolSimpleHeapFree(MemPool *pool, void *ptr) { SH_Free(pool->base, ptr);
 // failed call has no effect at all.
 bool InitRegionPool(MemPool *pool, const MemPool &ops, void *region, size_t size) {
   if (size != 0 && SH_Reset(region, size) != 0) return false;
-  std::memset(pool, 0, sizeof *pool);
-  pool->alloc = ops.alloc;
-  pool->calloc = ops.calloc;
-  pool->realloc = ops.realloc;
-  pool->free = ops.free;
+  *pool = ops;
   pool->base = region;
-  pool->lock = ops.lock;
   return true;
 }
 

@@ -23,54 +23,53 @@ static_assert(sizeof(RbtNode::key) == 4 && sizeof(RbtNode::val) == 4 &&
 
 namespace coffer {
 
-RbtNode *RBTSuccessor(const RbtCtx &c, const RbtNode *x) {
-  if (x->right != c.nilOff) {
-    RbtNode *y = c.N(x->right);
-    while (y->left != c.nilOff) y = c.N(y->left);
-    return y;
-  }
-  // Climb while we come from a right child; compare offsets, not addresses.
+namespace {
+
+// Each walk and balancing case has a mirror image; both are written once, for
+// the side L (true: left), with the near child on that side and the far one
+// opposite.
+template <bool L, class Node>
+inline auto &Near(Node *n) {
+  return L ? n->left : n->right;
+}
+template <bool L, class Node>
+inline auto &Far(Node *n) {
+  return L ? n->right : n->left;
+}
+
+// The last node on side L below xo (the leftmost for L true); the sentinel
+// for an empty subtree.
+template <bool L>
+RbtNode *Extreme(const RbtCtx &c, PoolOffset xo) {
+  if (xo == c.nilOff) return c.nil;
+  RbtNode *x = c.N(xo);
+  while (Near<L>(x) != c.nilOff) x = c.N(Near<L>(x));
+  return x;
+}
+
+// x's in-order neighbour on its far side (the successor for L true): the
+// nearest node of the far subtree, else the first ancestor reached from its
+// near side. The sentinel past the end.
+template <bool L>
+RbtNode *Neighbour(const RbtCtx &c, const RbtNode *x) {
+  if (Far<L>(x) != c.nilOff) return Extreme<L>(c, Far<L>(x));
+  // Climb while coming from the far side; compare offsets, not addresses.
   PoolOffset xo = c.O(x);
   for (PoolOffset yo = x->parent; yo != c.nilOff;) {
     RbtNode *y = c.N(yo);
-    if (y->right != xo) return y;
+    if (Far<L>(y) != xo) return y;
     xo = yo;
     yo = y->parent;
   }
   return c.nil;
 }
 
-RbtNode *RBTPredecessor(const RbtCtx &c, const RbtNode *x) {
-  if (x->left != c.nilOff) {
-    RbtNode *y = c.N(x->left);
-    while (y->right != c.nilOff) y = c.N(y->right);
-    return y;
-  }
-  PoolOffset xo = c.O(x);
-  for (PoolOffset yo = x->parent; yo != c.nilOff;) {
-    RbtNode *y = c.N(yo);
-    if (y->left != xo) return y;
-    xo = yo;
-    yo = y->parent;
-  }
-  return c.nil;
-}
+}  // namespace
 
-RbtNode *RBTMinimum(const RbtCtx &c) {
-  PoolOffset xo = c.d->root;
-  if (xo == c.nilOff) return c.nil;
-  RbtNode *x = c.N(xo);
-  while (x->left != c.nilOff) x = c.N(x->left);
-  return x;
-}
-
-RbtNode *RBTMaximum(const RbtCtx &c) {
-  PoolOffset xo = c.d->root;
-  if (xo == c.nilOff) return c.nil;
-  RbtNode *x = c.N(xo);
-  while (x->right != c.nilOff) x = c.N(x->right);
-  return x;
-}
+RbtNode *RBTSuccessor(const RbtCtx &c, const RbtNode *x) { return Neighbour<true>(c, x); }
+RbtNode *RBTPredecessor(const RbtCtx &c, const RbtNode *x) { return Neighbour<false>(c, x); }
+RbtNode *RBTMinimum(const RbtCtx &c) { return Extreme<true>(c, c.d->root); }
+RbtNode *RBTMaximum(const RbtCtx &c) { return Extreme<false>(c, c.d->root); }
 
 namespace {
 
@@ -88,18 +87,6 @@ inline void ReplaceChild(const RbtCtx &c, PoolOffset parent, PoolOffset old, Poo
 }
 
 inline uint8_t ColorOf(const RbtCtx &c, PoolOffset off) { return c.N(off)->color; }
-
-// Each balancing case has a mirror image; both are written once, for the
-// side L (true: left), with the near child on that side and the far one
-// opposite.
-template <bool L>
-inline PoolOffset &Near(RbtNode *n) {
-  return L ? n->left : n->right;
-}
-template <bool L>
-inline PoolOffset &Far(RbtNode *n) {
-  return L ? n->right : n->left;
-}
 
 // Lifts x's far child into x's place: Rotate<true> is the left rotation.
 // It never writes the sentinel, so a shared sentinel stays untouched.
