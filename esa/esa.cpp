@@ -20,8 +20,8 @@ namespace coffer {
 namespace {
 
 inline EsaArrayData *Data(const EsaArray *arr) { return static_cast<EsaArrayData *>(arr->data); }
-inline EsaEntry *Entries(const EsaArray *arr) { return At<EsaEntry>(arr, Data(arr)->entries); }
-inline const char *KeyOf(const EsaArray *arr, const EsaEntry *e) { return At<char>(arr, e->key); }
+inline EsaEntry *Entries(const EsaArray *arr) { return RecordAt<EsaEntry>(arr, Data(arr)->entries); }
+inline const char *KeyOf(const EsaArray *arr, const EsaEntry *e) { return RecordAt<char>(arr, e->key); }
 
 // The growth and shrink step. An increment below 1 would let growth add no
 // slot and an insertion write past the block, so such an increment counts
@@ -38,7 +38,7 @@ inline bool InRange(const EsaArray *arr, int32_t index) {
 // The callback fields are read afresh for every entry.
 void ReleaseEntry(EsaArray *arr, EsaEntry *e) {
   DropValue(arr, e->val);
-  PoolFree(arr, At<char>(arr, e->key));
+  PoolFree(arr, RecordAt<char>(arr, e->key));
 }
 
 // After a removal: shrink to exactly the entries in use once the slack
@@ -55,7 +55,7 @@ bool ESAResize(EsaArray *arr, int32_t n) {
   EsaArrayData *d = Data(arr);
   void *block = PoolRealloc(arr, OffsetToAddr(&arr->mp, d->entries), n * sizeof(EsaEntry));
   if (!block && n > 0) return false;
-  d->entries = Off(arr, block);
+  d->entries = OffsetOf(arr, block);
   d->capacity = n;
   return true;
 }
@@ -163,7 +163,7 @@ bool ESA_Insert(EsaArray *arr, const char *key, CofferVal val) {
   char *copy = PoolStrdup(arr, key);
   if (!copy) return false;
   ESAShiftEntries(arr, low, d->size, low + 1);
-  e[low].key = Off(arr, copy);
+  e[low].key = OffsetOf(arr, copy);
   e[low].val = val;
   d->size++;
   return true;

@@ -55,7 +55,7 @@ COFFER_API bool HST_CreateTreeData(HstTree *tree, char separator, CofferVal defa
     tree->data = nullptr;
     return false;
   }
-  data->root = NodeOff(tree, root);
+  data->root = OffsetOf(tree, root);
   return true;
 }
 
@@ -76,7 +76,7 @@ COFFER_API HstNode *HST_GetParent(HstTree *tree, HstNode *node) {
 }
 
 COFFER_API const char *HST_GetKey(HstTree *tree, HstNode *node) {
-  return At<const char>(tree, node->key);
+  return RecordAt<const char>(tree, node->key);
 }
 
 COFFER_API CofferVal HST_GetVal(HstTree *, HstNode *node) { return node->val; }
@@ -116,7 +116,7 @@ COFFER_API HstNode *HSTAllocNode(HstTree *tree, const char *key, CofferVal val) 
     if (node) PoolFree(tree, node);
     return nullptr;
   }
-  node->key = Off(tree, keyCopy);
+  node->key = OffsetOf(tree, keyCopy);
   node->val = val;
   Data(tree)->size++;
   return node;
@@ -129,15 +129,15 @@ COFFER_API bool HSTAllocChild(HstTree *tree, HstNode *node) {
   // The capacities go to the array unchanged; it guards against unusable ones.
   if (!ESA_CreateArrayData(&kids, data->childCapacity, data->childCapacityIncrement))
     return false;
-  node->children = Off(tree, kids.data);
+  node->children = OffsetOf(tree, kids.data);
   return true;
 }
 
 COFFER_API HstNode *HSTInsertChildNode(HstTree *tree, HstNode *parent, HstNode *node) {
   if (!parent->children && !HSTAllocChild(tree, parent)) return nullptr;
   EsaArray kids = Children(tree, parent);
-  if (!ESA_Insert(&kids, HST_GetKey(tree, node), NodeOff(tree, node))) return nullptr;
-  node->parent = NodeOff(tree, parent);
+  if (!ESA_Insert(&kids, HST_GetKey(tree, node), OffsetOf(tree, node))) return nullptr;
+  node->parent = OffsetOf(tree, parent);
   return node;
 }
 
@@ -147,11 +147,11 @@ COFFER_API HstNode *HST_InsertChild(HstTree *tree, HstNode *parent, const char *
   HstNode *node = HSTAllocNode(tree, key, val);
   if (!node) return nullptr;
   EsaArray kids = Children(tree, parent);
-  if (!ESA_Insert(&kids, key, NodeOff(tree, node))) {
+  if (!ESA_Insert(&kids, key, OffsetOf(tree, node))) {
     HSTFreeNode(tree, node);
     return nullptr;
   }
-  node->parent = NodeOff(tree, parent);
+  node->parent = OffsetOf(tree, parent);
   return node;
 }
 
@@ -162,7 +162,7 @@ COFFER_API void HSTFreeNode(HstTree *tree, HstNode *node) {
     EsaArray kids = Children(tree, node);
     ESA_FreeArray(&kids);
   }
-  PoolFree(tree, At<char>(tree, node->key));
+  PoolFree(tree, RecordAt<char>(tree, node->key));
   PoolFree(tree, node);
   Data(tree)->size--;
 }

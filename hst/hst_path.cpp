@@ -1,6 +1,4 @@
-// Path lookup and path insertion. A path's first character stands for the
-// leading separator and is never examined; the rest is names joined by the
-// tree's separator, and a separator at the very end stops the walk early.
+// Path lookup and path insertion over the path rules of hst_internal.h.
 #include <cstdlib>
 #include <cstring>
 
@@ -11,8 +9,8 @@ using namespace coffer::hst;
 
 namespace {
 
-// Walks the names of a path copy (which the walk cuts in place and restores)
-// from the root. With create set, a missing name is made with defaultVal.
+// Walks the names of a path copy from the root (see the path rules in
+// hst_internal.h). With create set, a missing name is made with defaultVal.
 // Returns the node named, or null when a name is missing or cannot be made.
 HstNode *WalkNames(HstTree *tree, char *copy, bool create) {
   HstTreeData *data = Data(tree);
@@ -23,32 +21,36 @@ HstNode *WalkNames(HstTree *tree, char *copy, bool create) {
   char *name = copy + 1;
   if (*name == '\0') return node;
   for (;;) {
-    // A NUL separator would match the terminator and lead the walk past it.
-    char *end = sep ? std::strchr(name, sep) : nullptr;
-    if (end) *end = '\0';
+    char *cut = FindCut(name, sep);
+    if (cut) *cut = '\0';
     HstNode *child = HST_FindChild(tree, node, name);
     if (!child && create) child = HST_InsertChild(tree, node, name, data->defaultVal);
-    if (end) *end = sep;
+    if (cut) *cut = sep;
     if (!child) return nullptr;
     node = child;
-    if (!end || end[1] == '\0') return node;
-    name = end + 1;
+    if (IsLastName(cut)) return node;
+    name = cut + 1;
   }
 }
 
 // Runs the walk on a process-heap copy of the path, so the caller's string
 // is never written and nothing of the walk lands in the pool.
 HstNode *WalkPath(HstTree *tree, const char *path, bool create) {
-  size_t len = std::strlen(path) + 1;
-  char *copy = static_cast<char *>(std::malloc(len));
+  char *copy = CopyPath(path);
   if (!copy) return nullptr;
-  std::memcpy(copy, path, len);
   HstNode *node = WalkNames(tree, copy, create);
   std::free(copy);
   return node;
 }
 
 }  // namespace
+
+char *coffer::hst::CopyPath(const char *path) {
+  size_t len = std::strlen(path) + 1;
+  char *copy = static_cast<char *>(std::malloc(len));
+  if (copy) std::memcpy(copy, path, len);
+  return copy;
+}
 
 extern "C" {
 

@@ -17,7 +17,7 @@ int32_t EntryOf(HstTree *tree, EsaArray *kids, HstNode *node) {
   const char *key = HST_GetKey(tree, node);
   int32_t found;
   if (!ESA_Find(kids, key, &found)) return -1;
-  const CofferVal off = NodeOff(tree, node);
+  const CofferVal off = OffsetOf(tree, node);
   const int32_t size = ESA_GetSize(kids);
   for (int32_t i = found; i >= 0 && std::strcmp(ESA_GetKey(kids, i), key) == 0; i--)
     if (ESA_GetVal(kids, i) == off) return i;
@@ -89,8 +89,8 @@ COFFER_API void HST_FreeTree(HstTree *tree) {
 COFFER_API bool HSTReplaceKey(HstTree *tree, HstNode *node, const char *newKey) {
   char *copy = PoolStrdup(tree, newKey);
   if (!copy) return false;
-  PoolFree(tree, At<char>(tree, node->key));
-  node->key = Off(tree, copy);
+  PoolFree(tree, RecordAt<char>(tree, node->key));
+  node->key = OffsetOf(tree, copy);
   return true;
 }
 

@@ -15,7 +15,7 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "mempool/pool.h"
+#include "hst/hst_internal.h"
 
 static_assert(offsetof(HstaaTree, hst) == 0, "an HstaaTree is also an HstTree and a MemPool");
 static_assert(offsetof(HstaaTree, cloneValFn) == sizeof(HstTree) &&
@@ -27,38 +27,23 @@ static_assert(offsetof(HstNode, subtreeValCount) == 16 && sizeof(HstNode) == 20,
 
 namespace {
 
+using coffer::hst::Children;
+using coffer::hst::CopyPath;
+using coffer::hst::Data;
+using coffer::hst::FindCut;
+using coffer::hst::IsLastName;
+using coffer::hst::NodeAt;
+
 // The two marks. Callers may compare the pointers: there is one of each.
 const char kMark[] = "#";
 const char kDoubleMark[] = "##";
 
-HstTreeData *Data(HstaaTree *tree) { return static_cast<HstTreeData *>(tree->hst.data); }
-char Separator(HstaaTree *tree) { return Data(tree)->separator; }
-
-// The one place where this layer turns pool offsets into records: a child
-// array entry holds its node's offset, a node holds its child array's.
-HstNode *NodeAt(HstaaTree *tree, CofferVal off) {
-  return coffer::At<HstNode>(&tree->hst, static_cast<PoolOffset>(off));
-}
-EsaArrayData *ChildArray(HstaaTree *tree, HstNode *node) {
-  return coffer::At<EsaArrayData>(&tree->hst, node->children);
-}
+char Separator(HstaaTree *tree) { return Data(&tree->hst)->separator; }
 
 // The template that an element key falls back on, if node has one.
 HstNode *FindRep(HstaaTree *tree, HstNode *node, const char *key) {
   const char *mark = HSTAA_GetArrayRep(key);
   return mark ? HST_FindChild(&tree->hst, node, mark) : nullptr;
-}
-
-// The separator behind the component that starts at text, or null when the
-// component runs to the end. A NUL separator would match the terminator and
-// lead the walk past it, so it never cuts.
-char *FindCut(char *text, char sep) { return sep ? std::strchr(text, sep) : nullptr; }
-
-char *CopyPath(const char *path) {
-  size_t n = std::strlen(path) + 1;
-  char *copy = static_cast<char *>(std::malloc(n));
-  if (copy) std::strncpy(copy, path, n);
-  return copy;
 }
 
 // Finds the child named key, or makes it: as a copy of its array's template
@@ -73,7 +58,7 @@ HstNode *InsertStep(HstaaTree *tree, HstNode *node, const char *key, bool *plain
     if (copy) HSTAAAdjustSubtreeValCount(h, node, copy->subtreeValCount);
     return copy;
   }
-  HstNode *child = HST_InsertChild(h, node, key, Data(tree)->defaultVal);
+  HstNode *child = HST_InsertChild(h, node, key, Data(h)->defaultVal);
   *plain = child != nullptr;
   return child;
 }
@@ -129,7 +114,7 @@ HstNode *HSTAAFindPrefix(HstaaTree *tree, HstNode *node, char *path, bool *outCo
       return node;
     }
     if (cut) *cut = sep;
-    if (!cut || !cut[1]) {
+    if (IsLastName(cut)) {
       *outComplete = true;
       return child;
     }
@@ -173,10 +158,10 @@ HstNode *HSTAAInsert(HstaaTree *tree, HstNode *node, char *path, CofferVal val) 
       // Elements take the value before their template; a refusal there does
       // not stop the insertion into the template.
       if (HSTAA_IsArrayRep(key))
-        HSTAAPropagateVal(tree, 0, node, child, cut ? cut + 1 : nullptr, val);
+        HSTAAPropagateVal(tree, HSTAA_PROPAGATE_INSERT, node, child, cut ? cut + 1 : nullptr, val);
       if (cut) *cut = sep;
       node = child;
-      if (!cut || !cut[1]) break;
+      if (IsLastName(cut)) break;
       key = cut + 1;
     }
   }
@@ -222,7 +207,8 @@ void HSTAARemove(HstaaTree *tree, HstNode *node, char *path, CofferVal val) {
   // A missing component ends the removal; a missing element is not looked
   // for in its template, whose values belong to the template alone.
   if (HstNode *child = HST_FindChild(h, node, path)) {
-    if (HSTAA_IsArrayRep(path)) HSTAAPropagateVal(tree, 1, node, child, rest, val);
+    if (HSTAA_IsArrayRep(path))
+      HSTAAPropagateVal(tree, HSTAA_PROPAGATE_REMOVE, node, child, rest, val);
     HSTAARemove(tree, child, rest, val);
     PruneAfterRemoval(tree, node, child, path);
   }
@@ -245,18 +231,18 @@ bool HSTAAPropagateVal(HstaaTree *tree, int32_t mode, HstNode *parent, HstNode *
   if (!HSTAA_IsArrayRep(mark) || !parent->children) return true;
   // The elements of an array follow its template in key order, so only that
   // run is visited: found by bisection, ended by the first other key.
-  EsaArray kids = coffer::TransientHandle(h, ChildArray(tree, parent));
+  EsaArray kids = Children(h, parent);
   int32_t i;
   if (!ESA_Find(&kids, mark, &i)) return true;
   ++i;
   for (;;) {
-    HstNode *elem = NodeAt(tree, ESA_GetVal(&kids, i));
+    HstNode *elem = NodeAt(h, static_cast<PoolOffset>(ESA_GetVal(&kids, i)));
     if (!elem) return true;
     const char *elemMark = HSTAA_GetArrayRep(HST_GetKey(h, elem));
     if (!elemMark || std::strcmp(elemMark, mark) != 0) return true;
-    if (mode == 0) {
+    if (mode == HSTAA_PROPAGATE_INSERT) {
       if (!HSTAAInsert(tree, elem, rest, val)) return false;
-    } else if (mode == 1) {
+    } else if (mode == HSTAA_PROPAGATE_REMOVE) {
       HSTAARemove(tree, elem, rest, val);
       if (elem->subtreeValCount == 0) {
         // Nothing left in it: drop it, and look at the same position again,

@@ -34,12 +34,16 @@ inline bool CallocBytes(size_t count, size_t size, size_t *bytes) {
 constexpr const char *kOutOfMemory = "Out of memory trying to allocate %zu bytes.";
 constexpr const char *kCallocOverflow = "%s: integer overflow (%zu, %zu";
 
-// Typed view of an offset in a container's pool.
+// The idiom every family uses, through its handle: RecordAt turns an offset
+// into the record it names, OffsetOf turns a record back into its offset.
+// Families wrap them once under their record's name (NodeAt, EntriesOf).
 template <class T>
-inline T *At(const CollectionHeader *h, PoolOffset off) {
+inline T *RecordAt(const CollectionHeader *h, PoolOffset off) {
   return static_cast<T *>(OffsetToAddr(&h->mp, off));
 }
-inline PoolOffset Off(const CollectionHeader *h, const void *p) { return AddrToOffset(&h->mp, p); }
+inline PoolOffset OffsetOf(const CollectionHeader *h, const void *p) {
+  return AddrToOffset(&h->mp, p);
+}
 
 // Every allocation of a container goes through its handle's pool copy, with
 // the handle itself as the pool argument.

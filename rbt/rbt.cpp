@@ -15,10 +15,10 @@ struct StringKey {
     if (!key) return false;
     char *copy = PoolStrdup(tree, key);
     if (!copy) return false;
-    *word = Off(tree, copy);
+    *word = OffsetOf(tree, copy);
     return true;
   }
-  static void Release(RbtTree *tree, uint32_t word) { PoolFree(tree, At<char>(tree, word)); }
+  static void Release(RbtTree *tree, uint32_t word) { PoolFree(tree, RecordAt<char>(tree, word)); }
 
   // Every key in the subtree being descended lies between the nearest
   // ancestors where the descent went left and right, so it shares with the
@@ -33,7 +33,7 @@ struct StringKey {
         : tree(t), key(reinterpret_cast<const signed char *>(k)) {}
 
     int Compare(const RbtNode *x) {
-      const signed char *other = At<const signed char>(tree, x->key);
+      const signed char *other = RecordAt<const signed char>(tree, x->key);
       uint32_t i = lcpLow < lcpHigh ? lcpLow : lcpHigh;
       while (key[i] == other[i] && key[i] != 0) ++i;
       stop = i;

@@ -1,6 +1,22 @@
 // Red-black balancing on a tree with a sentinel, shared by every key family:
 // neighbour walks, rotations, insertion fix-up, removal with successor
 // relinking, and the key-independent parts of the lifecycle.
+//
+// The invariants every call below restores before it returns (RBTCheckTree
+// verifies them in checking builds):
+//   1. every node is red or black; the root and the sentinel are black;
+//   2. a red node has two black children (absent children are the sentinel);
+//   3. every path from a node down to the sentinel passes the same number of
+//      black nodes (its black height);
+//   4. parent links mirror child links; the root's parent is the sentinel;
+//   5. in-order, keys never decrease, and equal keys stand in insertion
+//      order (an equal key is placed to the right);
+//   6. size counts the nodes reachable from the root;
+//   7. the sentinel's left and right name itself. Its parent is scratch
+//      space for the removal fix-up, written only there.
+// Nodes never move between records: removal relinks the successor node
+// instead of copying its contents, so a node pointer stays valid until that
+// very node is removed.
 #include <cstddef>
 
 #include "rbt/rbt_internal.h"
@@ -42,8 +58,8 @@ inline auto &Far(Node *n) {
 template <bool L>
 RbtNode *Extreme(const RbtCtx &c, PoolOffset xo) {
   if (xo == c.nilOff) return c.nil;
-  RbtNode *x = c.N(xo);
-  while (Near<L>(x) != c.nilOff) x = c.N(Near<L>(x));
+  RbtNode *x = c.NodeAt(xo);
+  while (Near<L>(x) != c.nilOff) x = c.NodeAt(Near<L>(x));
   return x;
 }
 
@@ -54,9 +70,9 @@ template <bool L>
 RbtNode *Neighbour(const RbtCtx &c, const RbtNode *x) {
   if (Far<L>(x) != c.nilOff) return Extreme<L>(c, Far<L>(x));
   // Climb while coming from the far side; compare offsets, not addresses.
-  PoolOffset xo = c.O(x);
+  PoolOffset xo = c.OffsetOf(x);
   for (PoolOffset yo = x->parent; yo != c.nilOff;) {
-    RbtNode *y = c.N(yo);
+    RbtNode *y = c.NodeAt(yo);
     if (Far<L>(y) != xo) return y;
     xo = yo;
     yo = y->parent;
@@ -79,23 +95,23 @@ inline void ReplaceChild(const RbtCtx &c, PoolOffset parent, PoolOffset old, Poo
     c.d->root = repl;
     return;
   }
-  RbtNode *p = c.N(parent);
+  RbtNode *p = c.NodeAt(parent);
   if (p->left == old)
     p->left = repl;
   else
     p->right = repl;
 }
 
-inline uint8_t ColorOf(const RbtCtx &c, PoolOffset off) { return c.N(off)->color; }
+inline uint8_t ColorOf(const RbtCtx &c, PoolOffset off) { return c.NodeAt(off)->color; }
 
 // Lifts x's far child into x's place: Rotate<true> is the left rotation.
 // It never writes the sentinel, so a shared sentinel stays untouched.
 template <bool L>
 void Rotate(const RbtCtx &c, RbtNode *x) {
-  PoolOffset xo = c.O(x), yo = Far<L>(x);
-  RbtNode *y = c.N(yo);
+  PoolOffset xo = c.OffsetOf(x), yo = Far<L>(x);
+  RbtNode *y = c.NodeAt(yo);
   Far<L>(x) = Near<L>(y);
-  if (Near<L>(y) != c.nilOff) c.N(Near<L>(y))->parent = xo;
+  if (Near<L>(y) != c.nilOff) c.NodeAt(Near<L>(y))->parent = xo;
   y->parent = x->parent;
   ReplaceChild(c, x->parent, xo, yo);
   Near<L>(y) = xo;
@@ -103,21 +119,28 @@ void Rotate(const RbtCtx &c, RbtNode *x) {
 }
 
 // One step of the insertion fix-up for a red z whose red parent p is the
-// child on side L of g. Returns the node to go on from.
+// child on side L of g (invariant 2 broken between z and p). Returns the
+// node to go on from.
 template <bool L>
 RbtNode *InsertStep(const RbtCtx &c, RbtNode *z, RbtNode *p, RbtNode *g) {
-  RbtNode *u = c.N(Far<L>(g));
+  RbtNode *u = c.NodeAt(Far<L>(g));
   if (u->color == kRbtRed) {
+    // Case 1, red uncle: push g's blackness down to p and u; g may now
+    // break invariant 2 with its own parent, so go on from g.
     p->color = kRbtBlack;
     u->color = kRbtBlack;
     g->color = kRbtRed;
     return g;
   }
-  if (Far<L>(p) == c.O(z)) {
+  if (Far<L>(p) == c.OffsetOf(z)) {
+    // Case 2, black uncle and z an inner grandchild: rotate it outward,
+    // which turns this into case 3 with the roles of z and p exchanged.
     z = p;
     Rotate<L>(c, z);
-    p = c.N(z->parent);
+    p = c.NodeAt(z->parent);
   }
+  // Case 3, black uncle and z an outer grandchild: rotate g down to the far
+  // side and swap its colour with p's. No red pair remains.
   p->color = kRbtBlack;
   g->color = kRbtRed;
   Rotate<!L>(c, g);
@@ -127,12 +150,12 @@ RbtNode *InsertStep(const RbtCtx &c, RbtNode *z, RbtNode *p, RbtNode *g) {
 void InsertFixup(const RbtCtx &c, RbtNode *z) {
   for (;;) {
     PoolOffset po = z->parent;
-    RbtNode *p = c.N(po);  // the sentinel (black) above the root ends the loop
+    RbtNode *p = c.NodeAt(po);  // the sentinel (black) above the root ends the loop
     if (p->color != kRbtRed) break;
-    RbtNode *g = c.N(p->parent);  // exists: a red parent is never the root
+    RbtNode *g = c.NodeAt(p->parent);  // exists: a red parent is never the root
     z = g->left == po ? InsertStep<true>(c, z, p, g) : InsertStep<false>(c, z, p, g);
   }
-  c.N(c.d->root)->color = kRbtBlack;
+  c.NodeAt(c.d->root)->color = kRbtBlack;
 }
 
 // One step of the removal fix-up for a doubly black x that is the child on
@@ -140,38 +163,46 @@ void InsertFixup(const RbtCtx &c, RbtNode *z) {
 // root once the extra black has been absorbed.
 template <bool L>
 PoolOffset DeleteStep(const RbtCtx &c, PoolOffset po) {
-  RbtNode *p = c.N(po);
-  RbtNode *w = c.N(Far<L>(p));
+  RbtNode *p = c.NodeAt(po);
+  RbtNode *w = c.NodeAt(Far<L>(p));  // x's sibling: never the sentinel
   if (w->color == kRbtRed) {
+    // Case 1, red sibling: rotate it above p so that x gets a black
+    // sibling, then go on with cases 2 to 4.
     w->color = kRbtBlack;
     p->color = kRbtRed;
     Rotate<L>(c, p);
-    w = c.N(Far<L>(p));
+    w = c.NodeAt(Far<L>(p));
   }
   if (ColorOf(c, w->left) == kRbtBlack && ColorOf(c, w->right) == kRbtBlack) {
+    // Case 2, black sibling with black children: take one black off both
+    // sides by making w red; the extra black climbs to p.
     w->color = kRbtRed;
     return po;
   }
   if (ColorOf(c, Far<L>(w)) == kRbtBlack) {
-    c.N(Near<L>(w))->color = kRbtBlack;
+    // Case 3, only w's near child is red: rotate it above w, which turns
+    // this into case 4.
+    c.NodeAt(Near<L>(w))->color = kRbtBlack;
     w->color = kRbtRed;
     Rotate<!L>(c, w);
-    w = c.N(Far<L>(p));
+    w = c.NodeAt(Far<L>(p));
   }
+  // Case 4, w's far child is red: rotate w above p and recolour; the extra
+  // black is absorbed and the fix-up ends.
   w->color = p->color;
   p->color = kRbtBlack;
-  c.N(Far<L>(w))->color = kRbtBlack;
+  c.NodeAt(Far<L>(w))->color = kRbtBlack;
   Rotate<L>(c, p);
   return c.d->root;
 }
 
 // x may be the sentinel; its parent field was set by the caller for this.
 void DeleteFixup(const RbtCtx &c, PoolOffset xo) {
-  RbtNode *x = c.N(xo);
+  RbtNode *x = c.NodeAt(xo);
   while (xo != c.d->root && x->color == kRbtBlack) {
     PoolOffset po = x->parent;
-    xo = c.N(po)->left == xo ? DeleteStep<true>(c, po) : DeleteStep<false>(c, po);
-    x = c.N(xo);
+    xo = c.NodeAt(po)->left == xo ? DeleteStep<true>(c, po) : DeleteStep<false>(c, po);
+    x = c.NodeAt(xo);
   }
   // Never recolours the sentinel: it is black already, and a caller's
   // sentinel may be shared with other trees.
@@ -180,12 +211,9 @@ void DeleteFixup(const RbtCtx &c, PoolOffset xo) {
 
 }  // namespace
 
-void RBTRotateLeft(const RbtCtx &c, RbtNode *x) { Rotate<true>(c, x); }
-void RBTRotateRight(const RbtCtx &c, RbtNode *x) { Rotate<false>(c, x); }
-
 void RBTAttach(const RbtCtx &c, RbtNode *z, RbtNode *parent, bool left) {
-  PoolOffset zo = c.O(z);
-  z->parent = c.O(parent);
+  PoolOffset zo = c.OffsetOf(z);
+  z->parent = c.OffsetOf(parent);
   if (parent == c.nil)
     c.d->root = zo;
   else if (left)
@@ -197,12 +225,12 @@ void RBTAttach(const RbtCtx &c, RbtNode *z, RbtNode *parent, bool left) {
 }
 
 void RBTUnlink(const RbtCtx &c, RbtNode *z) {
-  PoolOffset zo = c.O(z);
+  PoolOffset zo = c.OffsetOf(z);
   RbtNode *y = (z->left == c.nilOff || z->right == c.nilOff) ? z : RBTSuccessor(c, z);
-  PoolOffset yo = c.O(y);
+  PoolOffset yo = c.OffsetOf(y);
   PoolOffset xo = y->left != c.nilOff ? y->left : y->right;
   // Also for the sentinel: the fix-up climbs from it through this field.
-  c.N(xo)->parent = y->parent;
+  c.NodeAt(xo)->parent = y->parent;
   ReplaceChild(c, y->parent, yo, xo);
   if (y->color == kRbtBlack) DeleteFixup(c, xo);
   if (y == z) return;
@@ -214,8 +242,8 @@ void RBTUnlink(const RbtCtx &c, RbtNode *z) {
   y->left = z->left;
   y->right = z->right;
   y->color = z->color;
-  c.N(z->left)->parent = yo;
-  c.N(z->right)->parent = yo;
+  c.NodeAt(z->left)->parent = yo;
+  c.NodeAt(z->right)->parent = yo;
 }
 
 int32_t RBTCreateTreeData(RbtTree *tree, RbtNode *nil) {
@@ -232,7 +260,7 @@ int32_t RBTCreateTreeData(RbtTree *tree, RbtNode *nil) {
     }
     ownsNil = 1;
   }
-  PoolOffset nilOff = Off(tree, nil);
+  PoolOffset nilOff = OffsetOf(tree, nil);
   d->root = d->nil = nilOff;
   d->ownsNil = ownsNil;
   d->size = 0;

@@ -49,7 +49,7 @@ RbtNode *InsertNode(RbtTree *tree, RbtNode *node, typename K::Arg key, CofferVal
   RbtNode *y = c.nil;
   bool left = false;
   for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
-    y = c.N(xo);
+    y = c.NodeAt(xo);
     left = probe.Compare(y) < 0;
     if (left) {
       probe.WentLeft();
@@ -108,7 +108,7 @@ void FreeTree(RbtTree *tree) {
   auto *d = static_cast<RbtTreeData *>(tree->data);
   if (d) {
     if (d->size) Clear<K>(tree);
-    if (d->ownsNil) PoolFree(tree, At<RbtNode>(tree, d->nil));
+    if (d->ownsNil) PoolFree(tree, RecordAt<RbtNode>(tree, d->nil));
     tree->data = nullptr;  // a handle the caller keeps must not point at freed memory
     PoolFree(tree, d);
   }
@@ -121,7 +121,7 @@ RbtNode *Find(RbtTree *tree, typename K::Arg key) {
   RbtCtx c(tree);
   typename K::Probe probe(tree, key);
   for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
-    RbtNode *x = c.N(xo);
+    RbtNode *x = c.NodeAt(xo);
     int r = probe.Compare(x);
     if (r == 0) return x;
     if (r < 0) {
@@ -146,7 +146,7 @@ RbtNode *Bound(RbtTree *tree, typename K::Arg key) {
   typename K::Probe probe(tree, key);
   RbtNode *bound = nullptr;
   for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
-    RbtNode *x = c.N(xo);
+    RbtNode *x = c.NodeAt(xo);
     int r = probe.Compare(x);
     if (kPastEqual ? r < 0 : r <= 0) {
       bound = x;

@@ -26,11 +26,12 @@ struct RbtCtx {
   PoolOffset nilOff;
 
   explicit RbtCtx(RbtTree *tree)
-      : t(tree), d(static_cast<RbtTreeData *>(tree->data)), nil(At<RbtNode>(tree, d->nil)),
+      : t(tree), d(static_cast<RbtTreeData *>(tree->data)), nil(RecordAt<RbtNode>(tree, d->nil)),
         nilOff(d->nil) {}
 
-  RbtNode *N(PoolOffset off) const { return At<RbtNode>(t, off); }
-  PoolOffset O(const RbtNode *n) const { return Off(t, n); }
+  // The tree's one place where offsets and nodes meet.
+  RbtNode *NodeAt(PoolOffset off) const { return RecordAt<RbtNode>(t, off); }
+  PoolOffset OffsetOf(const RbtNode *n) const { return coffer::OffsetOf(t, n); }
   // Null for the sentinel: what the public calls hand back.
   RbtNode *OrNull(RbtNode *n) const { return n == nil ? nullptr : n; }
 };
@@ -41,9 +42,6 @@ RbtNode *RBTPredecessor(const RbtCtx &c, const RbtNode *x);
 // Leftmost and rightmost nodes; the sentinel for an empty tree.
 RbtNode *RBTMinimum(const RbtCtx &c);
 RbtNode *RBTMaximum(const RbtCtx &c);
-
-void RBTRotateLeft(const RbtCtx &c, RbtNode *x);
-void RBTRotateRight(const RbtCtx &c, RbtNode *x);
 
 // Links a filled red node z below parent (the sentinel for an empty tree) on
 // the given side, rebalances and counts it.

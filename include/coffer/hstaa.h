@@ -29,6 +29,12 @@ struct HstaaTree {
   HstaaValFn removeValFn;
 };
 
+/* The modes of HSTAAPropagateVal: carry an insertion or a removal into the
+ * elements of an array. Any other mode visits the elements and changes
+ * nothing. */
+#define HSTAA_PROPAGATE_INSERT 0
+#define HSTAA_PROPAGATE_REMOVE 1
+
 COFFER_API int32_t HSTAA_GetSubtreeValCount(HstaaTree *tree, HstNode *node);
 COFFER_API bool HSTAA_IsArrayRep(const char *key);
 COFFER_API const char *HSTAA_GetArrayRep(const char *key);

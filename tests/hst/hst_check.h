@@ -21,7 +21,7 @@ constexpr CofferVal kDefault = 0xDEF0;
 using V = std::vector<CofferVal>;
 
 inline EsaArray ChildArray(HstTree *tree, HstNode *node) {
-  return coffer::TransientHandle(tree, coffer::At<EsaArrayData>(tree, node->children));
+  return coffer::TransientHandle(tree, coffer::RecordAt<EsaArrayData>(tree, node->children));
 }
 
 // Child arrays in strcmp order, every entry's key equal to its node's key,
@@ -114,7 +114,7 @@ inline void ExpectCopiesReleased() {
 // node that had none before.
 inline size_t KeptArrayBlocks(HstTree *tree, HstNode *node, bool hadArray) {
   if (hadArray || !node->children) return 0;
-  auto *arr = coffer::At<EsaArrayData>(tree, node->children);
+  auto *arr = coffer::RecordAt<EsaArrayData>(tree, node->children);
   EXPECT_EQ(arr->size, 0);
   return 1 + (arr->entries != 0);
 }

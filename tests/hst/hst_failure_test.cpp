@@ -179,7 +179,7 @@ TEST(HstFailure, InsertPathAtEveryPoint) {
     size_t blocks = live + (b ? 3 : 0);
     for (HstNode *n : {HST_Find(f.t, "/a"), b})
       if (n && n->children)
-        blocks += 1 + (coffer::At<EsaArrayData>(f.t, n->children)->entries != 0);
+        blocks += 1 + (coffer::RecordAt<EsaArrayData>(f.t, n->children)->entries != 0);
     EXPECT_EQ(f.tp.liveBlocks(), blocks);
     EXPECT_EQ(HST_GetSize(f.t), b ? 3 : 2);
     EXPECT_EQ(HST_GetVal(f.t, HST_Find(f.t, "/a")), 1u);

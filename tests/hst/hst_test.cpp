@@ -235,7 +235,7 @@ TEST_F(HstTest, ChildCapacitiesHandedOnUnchanged) {
       EXPECT_EQ(HST_InsertChild(t, HST_GetRoot(t), "a", 1), nullptr);
       EXPECT_EQ(tp.liveBlocks(), live);
     } else {
-      auto *arr = coffer::At<EsaArrayData>(t, HST_GetRoot(t)->children);
+      auto *arr = coffer::RecordAt<EsaArrayData>(t, HST_GetRoot(t)->children);
       EXPECT_EQ(arr->capacityIncrement, inc);
       EXPECT_EQ(arr->capacity, cap ? cap : 3);
     }

@@ -21,7 +21,7 @@
 namespace rbt_test {
 
 inline RbtTreeData *DataOf(const RbtTree *t) { return static_cast<RbtTreeData *>(t->data); }
-inline RbtNode *NodeAt(const RbtTree *t, PoolOffset off) { return coffer::At<RbtNode>(t, off); }
+inline RbtNode *NodeAt(const RbtTree *t, PoolOffset off) { return coffer::RecordAt<RbtNode>(t, off); }
 inline RbtNode *NilOf(const RbtTree *t) { return NodeAt(t, DataOf(t)->nil); }
 inline RbtNode *RootOf(const RbtTree *t) { return NodeAt(t, DataOf(t)->root); }
 inline CofferVal ValOr0(const RbtNode *n) { return n ? n->val : 0; }
@@ -64,7 +64,7 @@ struct StringFamily {
   using Key = std::string;
   static constexpr bool kCopiesKey = true;
   RBT_TEST_FAMILY_CALLS(RBT, RBT_TEST_STR_ARG)
-  static Key KeyOf(const RbtTree *t, const RbtNode *n) { return coffer::At<char>(t, n->key); }
+  static Key KeyOf(const RbtTree *t, const RbtNode *n) { return coffer::RecordAt<char>(t, n->key); }
   static Key MakeKey(int i) { return std::string(1, static_cast<char>('a' + i)); }
   // Bytes as signed values, the terminator included as 0.
   static bool Less(const Key &a, const Key &b) {
