@@ -6,7 +6,6 @@
 #include <cstring>
 
 #include "esa/esa_internal.h"
-#include "mempool/pool.h"
 
 static_assert(sizeof(EsaArrayData) == 16, "EsaArrayData is 16 bytes");
 static_assert(offsetof(EsaArrayData, entries) == 0 && offsetof(EsaArrayData, size) == 4 &&
@@ -18,10 +17,6 @@ static_assert(sizeof(EsaEntry) == 8 && offsetof(EsaEntry, key) == 0 && offsetof(
 
 namespace coffer {
 namespace {
-
-inline EsaArrayData *Data(const EsaArray *arr) { return static_cast<EsaArrayData *>(arr->data); }
-inline EsaEntry *Entries(const EsaArray *arr) { return RecordAt<EsaEntry>(arr, Data(arr)->entries); }
-inline const char *KeyOf(const EsaArray *arr, const EsaEntry *e) { return RecordAt<char>(arr, e->key); }
 
 // The growth and shrink step. An increment below 1 would let growth add no
 // slot and an insertion write past the block, so such an increment counts
@@ -62,7 +57,7 @@ bool ESAResize(EsaArray *arr, int32_t n) {
 
 void ESAShiftEntries(EsaArray *arr, int32_t from, int32_t to, int32_t dest) {
   if (from >= to) return;
-  EsaEntry *e = Entries(arr);
+  EsaEntry *e = EntriesOf(arr);
   std::memmove(e + dest, e + from, (to - from) * sizeof(EsaEntry));
 }
 
@@ -89,6 +84,7 @@ EsaArray *ESA_AllocArray(int32_t initialCapacity, int32_t capacityIncrement) {
 }
 
 bool ESA_CreateArrayData(EsaArray *arr, int32_t initialCapacity, int32_t capacityIncrement) {
+  COFFER_CHECK_ON_RETURN("sorted string array", ESACheckArray, arr);
   arr->data = nullptr;
   // A negative capacity has no meaning; refuse it before anything is made.
   if (initialCapacity < 0) return false;
@@ -107,7 +103,7 @@ void ESA_FreeArray(EsaArray *arr) {
   if (!arr) return;
   if (EsaArrayData *d = Data(arr)) {
     ESA_Clear(arr);
-    if (d->entries) PoolFree(arr, Entries(arr));
+    if (d->entries) PoolFree(arr, EntriesOf(arr));
     PoolFree(arr, d);
   }
   ReleaseHandle(arr);
@@ -124,24 +120,25 @@ FreeValFn ESA_SetFreeValFn(EsaArray *arr, FreeValFn fn) { return SetFreeValFn(ar
 MpFreeValFn ESA_SetMpFreeValFn(EsaArray *arr, MpFreeValFn fn) { return SetMpFreeValFn(arr, fn); }
 
 EsaEntry *ESA_Get(EsaArray *arr, int32_t index) {
-  return InRange(arr, index) ? Entries(arr) + index : nullptr;
+  return InRange(arr, index) ? EntriesOf(arr) + index : nullptr;
 }
 
 const char *ESA_GetKey(EsaArray *arr, int32_t index) {
-  return InRange(arr, index) ? KeyOf(arr, Entries(arr) + index) : nullptr;
+  return InRange(arr, index) ? KeyOf(arr, EntriesOf(arr) + index) : nullptr;
 }
 
 CofferVal ESA_GetVal(EsaArray *arr, int32_t index) {
-  return InRange(arr, index) ? Entries(arr)[index].val : 0;
+  return InRange(arr, index) ? EntriesOf(arr)[index].val : 0;
 }
 
 bool ESA_SetVal(EsaArray *arr, int32_t index, CofferVal val) {
   if (!InRange(arr, index)) return false;
-  Entries(arr)[index].val = val;  // the old value stays the caller's
+  EntriesOf(arr)[index].val = val;  // the old value stays the caller's
   return true;
 }
 
 bool ESA_Insert(EsaArray *arr, const char *key, CofferVal val) {
+  COFFER_CHECK_ON_RETURN("sorted string array", ESACheckArray, arr);
   EsaArrayData *d = Data(arr);
   if (d->size == d->capacity) {
     int32_t step = Step(d);
@@ -149,7 +146,7 @@ bool ESA_Insert(EsaArray *arr, const char *key, CofferVal val) {
   }
   // Bisect to the slot after every key <= the new one, so equal keys keep
   // their insertion order.
-  EsaEntry *e = Entries(arr);
+  EsaEntry *e = EntriesOf(arr);
   int32_t low = 0, high = d->size - 1;
   while (low <= high) {
     int32_t middle = low + (high - low) / 2;
@@ -171,7 +168,7 @@ bool ESA_Insert(EsaArray *arr, const char *key, CofferVal val) {
 
 bool ESA_Find(EsaArray *arr, const char *key, int32_t *outIndex) {
   EsaArrayData *d = Data(arr);
-  EsaEntry *e = Entries(arr);
+  EsaEntry *e = EntriesOf(arr);
   int32_t low = 0, high = d->size - 1;
   while (low <= high) {
     int32_t middle = low + (high - low) / 2;
@@ -189,9 +186,10 @@ bool ESA_Find(EsaArray *arr, const char *key, int32_t *outIndex) {
 }
 
 bool ESA_Remove(EsaArray *arr, int32_t index) {
+  COFFER_CHECK_ON_RETURN("sorted string array", ESACheckArray, arr);
   if (!InRange(arr, index)) return false;
   EsaArrayData *d = Data(arr);
-  ReleaseEntry(arr, Entries(arr) + index);
+  ReleaseEntry(arr, EntriesOf(arr) + index);
   ESAShiftEntries(arr, index + 1, d->size, index);
   d->size--;
   ShrinkIfSlack(arr);
@@ -199,9 +197,10 @@ bool ESA_Remove(EsaArray *arr, int32_t index) {
 }
 
 bool ESA_RemoveRange(EsaArray *arr, int32_t first, int32_t end) {
+  COFFER_CHECK_ON_RETURN("sorted string array", ESACheckArray, arr);
   EsaArrayData *d = Data(arr);
   if (!(first < end && end <= d->size && first >= 0)) return false;
-  for (int32_t i = first; i < end; i++) ReleaseEntry(arr, Entries(arr) + i);
+  for (int32_t i = first; i < end; i++) ReleaseEntry(arr, EntriesOf(arr) + i);
   ESAShiftEntries(arr, end, d->size, first);
   d->size -= end - first;
   ShrinkIfSlack(arr);

@@ -4,7 +4,21 @@
 
 #include <coffer/esa.h>
 
+#include "mempool/check.h"
+#include "mempool/pool.h"
+
 namespace coffer {
+
+// The array's one place where offsets become records.
+inline EsaArrayData *Data(const EsaArray *arr) { return static_cast<EsaArrayData *>(arr->data); }
+inline EsaEntry *EntriesOf(const EsaArray *arr) { return RecordAt<EsaEntry>(arr, Data(arr)->entries); }
+inline const char *KeyOf(const EsaArray *arr, const EsaEntry *e) { return RecordAt<char>(arr, e->key); }
+
+// Invariants of an array between calls: 0 <= size <= capacity; an entry
+// block exists whenever there are slots; every entry in use holds a key copy,
+// and the keys ascend in strcmp order. Equal keys keep their insertion order,
+// which no structure records, so only the order itself is checked.
+bool ESACheckArray(const EsaArray *arr, CheckFault *fault);  // true for no data
 
 // Reallocates the entry block to n slots. Refuses a negative count or one
 // whose byte size does not fit in 32 bits; a shrink to 0 slots always works.

@@ -8,6 +8,7 @@
 
 #include <cstring>
 
+#include "mempool/check.h"
 #include "mempool/pool.h"
 
 namespace coffer {
@@ -22,6 +23,22 @@ inline HstNode *NodeAt(HstTree *tree, PoolOffset off) { return RecordAt<HstNode>
 inline EsaArray Children(HstTree *tree, HstNode *node) {
   return TransientHandle(tree, RecordAt<EsaArrayData>(tree, node->children));
 }
+
+// Invariants of a tree between calls: the root is named "" and has no
+// parent; every node is reachable from it, exactly once, and size counts
+// them (nodes the caller holds detached after HSTAllocNode are not allowed
+// to exist while a checked call runs); each node's child array holds the
+// children in strcmp order of their names, each entry named like its node,
+// whose parent names the array's owner. With counts, as the associative
+// arrays keep them, every subtreeValCount is at least the sum of its
+// children's (what the node holds itself is not recorded anywhere else).
+bool HSTCheckTree(HstTree *tree, bool counts, CheckFault *fault);
+
+// Checking builds check the tree whenever a call that changed it returns.
+// Only the calls a caller makes on a whole tree do so: the node primitives
+// run while a copy is still detached.
+#define HST_CHECKED(tree) \
+  COFFER_CHECK_ON_RETURN("string tree", coffer::hst::HSTCheckTree, tree, false)
 
 // Path rules, shared with the associative arrays. A path's first character
 // stands for the leading separator and is skipped; the rest is names joined

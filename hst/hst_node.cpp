@@ -42,6 +42,7 @@ COFFER_API HstTree *HST_AllocTreeEx(MemPool *pool, char separator, CofferVal def
 
 COFFER_API bool HST_CreateTreeData(HstTree *tree, char separator, CofferVal defaultVal,
                                    int32_t childCapacity, int32_t childCapacityIncrement) {
+  HST_CHECKED(tree);
   auto *data = static_cast<HstTreeData *>(PoolCalloc(tree, sizeof(HstTreeData)));
   tree->data = data;
   if (!data) return false;
@@ -143,6 +144,7 @@ COFFER_API HstNode *HSTInsertChildNode(HstTree *tree, HstNode *parent, HstNode *
 
 COFFER_API HstNode *HST_InsertChild(HstTree *tree, HstNode *parent, const char *key,
                                     CofferVal val) {
+  HST_CHECKED(tree);
   if (!parent->children && !HSTAllocChild(tree, parent)) return nullptr;
   HstNode *node = HSTAllocNode(tree, key, val);
   if (!node) return nullptr;

@@ -59,6 +59,7 @@ COFFER_API HstNode *HST_Find(HstTree *tree, const char *path) {
 }
 
 COFFER_API HstNode *HST_Insert(HstTree *tree, const char *path, CofferVal val) {
+  HST_CHECKED(tree);
   HstNode *node = WalkPath(tree, path, true);
   // The old value is overwritten, not released: replacing never releases.
   if (node) HST_SetVal(tree, node, val);

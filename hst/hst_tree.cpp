@@ -42,6 +42,7 @@ COFFER_API void HSTFreeSubtree(HstTree *tree, HstNode *node) {
 }
 
 COFFER_API void HST_RemoveSubtree(HstTree *tree, HstNode *node) {
+  HST_CHECKED(tree);
   // The root has no entry to unlink and the tree record must keep naming a
   // live root, so removing it empties the tree instead.
   if (node == HST_GetRoot(tree)) {
@@ -58,6 +59,7 @@ COFFER_API void HST_RemoveSubtree(HstTree *tree, HstNode *node) {
 }
 
 COFFER_API void HST_Clear(HstTree *tree) {
+  HST_CHECKED(tree);
   HstTreeData *data = Data(tree);
   HstNode *root = HST_GetRoot(tree);
   const int32_t n = HST_GetNumChildren(tree, root);
@@ -94,8 +96,14 @@ COFFER_API bool HSTReplaceKey(HstTree *tree, HstNode *node, const char *newKey) 
   return true;
 }
 
-COFFER_API HstNode *HST_CloneSubtree(HstTree *tree, HstNode *src, HstCloneValFn cloneValFn,
-                                     const char *newKey, HstNode *dstParent) {
+}  // extern "C"
+
+namespace {
+
+// Makes the copy depth first: the whole copy stays detached until its top
+// is attached last, so a failure anywhere releases it with no entry to undo.
+HstNode *CloneSubtree(HstTree *tree, HstNode *src, HstCloneValFn cloneValFn, const char *newKey,
+                      HstNode *dstParent) {
   const CofferVal defaultVal = Data(tree)->defaultVal;
   CofferVal val = defaultVal;
   const bool cloned = src->val != defaultVal;
@@ -113,7 +121,7 @@ COFFER_API HstNode *HST_CloneSubtree(HstTree *tree, HstNode *src, HstCloneValFn 
   // (or under one of its descendants) does not contain itself.
   const int32_t n = HST_GetNumChildren(tree, src);
   for (int32_t i = 0; i < n; i++) {
-    if (!HST_CloneSubtree(tree, HST_GetChild(tree, src, i), cloneValFn, nullptr, copy)) {
+    if (!CloneSubtree(tree, HST_GetChild(tree, src, i), cloneValFn, nullptr, copy)) {
       HSTFreeSubtree(tree, copy);
       return nullptr;
     }
@@ -124,6 +132,16 @@ COFFER_API HstNode *HST_CloneSubtree(HstTree *tree, HstNode *src, HstCloneValFn 
     return nullptr;
   }
   return copy;
+}
+
+}  // namespace
+
+extern "C" {
+
+COFFER_API HstNode *HST_CloneSubtree(HstTree *tree, HstNode *src, HstCloneValFn cloneValFn,
+                                     const char *newKey, HstNode *dstParent) {
+  HST_CHECKED(tree);
+  return CloneSubtree(tree, src, cloneValFn, newKey, dstParent);
 }
 
 COFFER_API void HSTAAAdjustSubtreeValCount(HstTree *tree, HstNode *node, int32_t delta) {

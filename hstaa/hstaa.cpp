@@ -34,6 +34,12 @@ using coffer::hst::FindCut;
 using coffer::hst::IsLastName;
 using coffer::hst::NodeAt;
 
+// Checking builds check the tree and its value counts whenever a call that
+// may have changed them returns; the counts hold between any two such calls,
+// nested ones included, since every change is carried up to the root at once.
+#define HSTAA_CHECKED(tree) \
+  COFFER_CHECK_ON_RETURN("associative array", coffer::hst::HSTCheckTree, &(tree)->hst, true)
+
 // The two marks. Callers may compare the pointers: there is one of each.
 const char kMark[] = "#";
 const char kDoubleMark[] = "##";
@@ -138,6 +144,7 @@ HstNode *HSTAA_FindPrefix(HstaaTree *tree, const char *path, bool *outComplete) 
 }
 
 HstNode *HSTAAInsert(HstaaTree *tree, HstNode *node, char *path, CofferVal val) {
+  HSTAA_CHECKED(tree);
   HstTree *h = &tree->hst;
   // The topmost node this call made as a plain path step. All nodes made
   // after it lie below it, so removing it undoes every plain step at once.
@@ -190,6 +197,7 @@ HstNode *HSTAA_Insert(HstaaTree *tree, const char *path, CofferVal val) {
 }
 
 void HSTAARemove(HstaaTree *tree, HstNode *node, char *path, CofferVal val) {
+  HSTAA_CHECKED(tree);
   HstTree *h = &tree->hst;
   if (!path || !*path) {
     CofferVal cur = HST_GetVal(h, node);
@@ -226,6 +234,7 @@ bool HSTAA_Remove(HstaaTree *tree, const char *path, CofferVal val) {
 
 bool HSTAAPropagateVal(HstaaTree *tree, int32_t mode, HstNode *parent, HstNode *rep, char *rest,
                        CofferVal val) {
+  HSTAA_CHECKED(tree);
   HstTree *h = &tree->hst;
   const char *mark = HST_GetKey(h, rep);
   if (!HSTAA_IsArrayRep(mark) || !parent->children) return true;

@@ -54,4 +54,5 @@ void RBTRemoveNode(RbtTree *tree, RbtNode *z) { rbt::RemoveNode<StringKey>(RbtCt
 
 }  // namespace coffer
 
-COFFER_RBT_DEFINE_FAMILY(RBT, coffer::StringKey, const char *, RBTInsertNode, RBTRemoveNode)
+COFFER_RBT_DEFINE_FAMILY(RBT, coffer::StringKey, const char *, kRbtStringKeys, RBTInsertNode,
+                         RBTRemoveNode)

@@ -193,9 +193,13 @@ inline int32_t GetSize(RbtTree *tree) {
 }  // namespace coffer
 
 // The twenty exported calls of one family P over key policy K (KeyT is the
-// key type of P's declarations in coffer/rbt.h), whose insertion and removal
-// are the family's internal INSERT and REMOVE.
-#define COFFER_RBT_DEFINE_FAMILY(P, K, KeyT, INSERT, REMOVE)                                     \
+// key type of P's declarations in coffer/rbt.h, KIND the order its checker
+// applies), whose insertion and removal are the family's internal INSERT and
+// REMOVE. In checking builds every call that changes a tree checks it on
+// the way out.
+#define COFFER_RBT_CHECKED(tree, KIND) \
+  COFFER_CHECK_ON_RETURN("red-black tree", coffer::RBTCheckTree, tree, coffer::KIND)
+#define COFFER_RBT_DEFINE_FAMILY(P, K, KeyT, KIND, INSERT, REMOVE)                               \
   extern "C" {                                                                                   \
   RbtTree *P##_AllocTree(void) { return coffer::RBTAllocTreeOnStdHeap(); }                       \
   RbtTree *P##_AllocTreeEx(MemPool *pool) { return coffer::RBTAllocTree(pool, nullptr); }        \
@@ -203,10 +207,14 @@ inline int32_t GetSize(RbtTree *tree) {
     return coffer::RBTAllocTree(pool, nil);                                                      \
   }                                                                                              \
   int32_t P##_CreateTreeData(RbtTree *tree, RbtNode *nil) {                                      \
+    COFFER_RBT_CHECKED(tree, KIND);                                                              \
     return coffer::RBTCreateTreeData(tree, nil);                                                 \
   }                                                                                              \
   void P##_FreeTree(RbtTree *tree) { coffer::rbt::FreeTree<K>(tree); }                           \
-  void P##_Clear(RbtTree *tree) { coffer::rbt::Clear<K>(tree); }                                 \
+  void P##_Clear(RbtTree *tree) {                                                                \
+    COFFER_RBT_CHECKED(tree, KIND);                                                              \
+    coffer::rbt::Clear<K>(tree);                                                                 \
+  }                                                                                              \
   int32_t P##_GetSize(RbtTree *tree) { return coffer::rbt::GetSize(tree); }                      \
   FreeValFn P##_SetFreeValFn(RbtTree *tree, FreeValFn fn) {                                      \
     return coffer::SetFreeValFn(tree, fn);                                                       \
@@ -214,15 +222,25 @@ inline int32_t GetSize(RbtTree *tree) {
   MpFreeValFn P##_SetMpFreeValFn(RbtTree *tree, MpFreeValFn fn) {                                \
     return coffer::SetMpFreeValFn(tree, fn);                                                     \
   }                                                                                              \
-  void P##_Swap(RbtTree *tree, RbtTree *other) { coffer::RBTSwap(tree, other); }                 \
+  void P##_Swap(RbtTree *tree, RbtTree *other) {                                                 \
+    COFFER_RBT_CHECKED(tree, KIND);                                                              \
+    coffer::RBTSwap(tree, other);                                                                \
+    COFFER_CHECK("red-black tree", coffer::RBTCheckTree, other, coffer::KIND);                   \
+  }                                                                                              \
   RbtNode *P##_Insert(RbtTree *tree, KeyT key, CofferVal val) {                                  \
+    COFFER_RBT_CHECKED(tree, KIND);                                                              \
     return coffer::INSERT(tree, nullptr, key, val);                                              \
   }                                                                                              \
   RbtNode *P##_InsertNoAlloc(RbtTree *tree, RbtNode *node, KeyT key, CofferVal val) {            \
+    COFFER_RBT_CHECKED(tree, KIND);                                                              \
     return coffer::INSERT(tree, node, key, val);                                                 \
   }                                                                                              \
-  void P##_Remove(RbtTree *tree, RbtNode *node) { coffer::REMOVE(tree, node); }                  \
+  void P##_Remove(RbtTree *tree, RbtNode *node) {                                                \
+    COFFER_RBT_CHECKED(tree, KIND);                                                              \
+    coffer::REMOVE(tree, node);                                                                  \
+  }                                                                                              \
   void P##_RemoveRange(RbtTree *tree, RbtNode *first, RbtNode *end) {                            \
+    COFFER_RBT_CHECKED(tree, KIND);                                                              \
     coffer::rbt::RemoveRange<K>(tree, first, end);                                               \
   }                                                                                              \
   RbtNode *P##_Find(RbtTree *tree, KeyT key) { return coffer::rbt::Find<K>(tree, key); }         \

@@ -9,6 +9,7 @@
 
 #include <coffer/rbt.h>
 
+#include "mempool/check.h"
 #include "mempool/pool.h"
 
 namespace coffer {
@@ -51,6 +52,13 @@ void RBTAttach(const RbtCtx &c, RbtNode *z, RbtNode *parent, bool left);
 // successor node is relinked into z's place. Touches neither z's key nor its
 // value, releases nothing and leaves size alone.
 void RBTUnlink(const RbtCtx &c, RbtNode *z);
+
+// The key order a tree's checker applies: the family's own.
+enum RbtKeyKind { kRbtStringKeys, kRbtInt32Keys, kRbtVoidPtrKeys };
+
+// Verifies the invariants stated in rbt_core.cpp: sentinel, colours, black
+// heights, parent links, key order and size. True for a handle without data.
+bool RBTCheckTree(const RbtTree *tree, RbtKeyKind kind, CheckFault *fault);
 
 // Lifecycle steps common to the families. RBTCreateTreeData builds the data
 // record and (without a caller's sentinel) the sentinel through the handle;

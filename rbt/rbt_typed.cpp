@@ -64,7 +64,7 @@ void RbtVoidPtrRemoveNode(RbtTree *tree, RbtNode *z) {
 
 }  // namespace coffer
 
-COFFER_RBT_DEFINE_FAMILY(RbtInt32, coffer::Int32Key, int32_t, RbtInt32InsertNode,
+COFFER_RBT_DEFINE_FAMILY(RbtInt32, coffer::Int32Key, int32_t, kRbtInt32Keys, RbtInt32InsertNode,
                          RbtInt32RemoveNode)
-COFFER_RBT_DEFINE_FAMILY(RbtVoidPtr, coffer::VoidPtrKey, const void *, RbtVoidPtrInsertNode,
-                         RbtVoidPtrRemoveNode)
+COFFER_RBT_DEFINE_FAMILY(RbtVoidPtr, coffer::VoidPtrKey, const void *, kRbtVoidPtrKeys,
+                         RbtVoidPtrInsertNode, RbtVoidPtrRemoveNode)
