@@ -17,7 +17,6 @@ struct Walk {
   bool Visit(HstNode *node) {
     const PoolOffset off = OffsetOf(tree, node);
     if (++seen > Data(tree)->size) return Fault(fault, "more nodes than size counts", off);
-    if (node->key == 0) return Fault(fault, "node without a name", off);
     if (counts && node->subtreeValCount < 0) return Fault(fault, "negative value count", off);
     if (!node->children) return true;
     EsaArray kids = Children(tree, node);
@@ -27,6 +26,7 @@ struct Walk {
       HstNode *child = NodeAt(tree, static_cast<PoolOffset>(ESA_GetVal(&kids, i)));
       if (!child) return Fault(fault, "child entry names no node", off);
       if (child->parent != off) return Fault(fault, "parent link disagrees with child entry", off);
+      if (child->key == 0) return Fault(fault, "node without a name", OffsetOf(tree, child));
       if (std::strcmp(ESA_GetKey(&kids, i), HST_GetKey(tree, child)) != 0)
         return Fault(fault, "child entry named unlike its node", OffsetOf(tree, child));
       if (!Visit(child)) return false;
@@ -44,7 +44,7 @@ bool HSTCheckTree(HstTree *tree, bool counts, CheckFault *fault) {
   HstTreeData *data = Data(tree);
   if (!data) return true;
   HstNode *root = HST_GetRoot(tree);
-  if (!root || root->parent != 0 || HST_GetKey(tree, root)[0] != '\0')
+  if (!root || root->parent != 0 || root->key == 0 || HST_GetKey(tree, root)[0] != '\0')
     return Fault(fault, "root missing, named or with a parent", data->root);
   Walk walk{tree, counts, fault};
   if (!walk.Visit(root)) return false;

@@ -73,8 +73,7 @@ TEST(PoolConventions, HandlesAndTheirRelease) {
 TEST(PoolConventions, SettersKeepAtMostOneCallbackAndDropUsesIt) {
   using namespace coffer_test;
   CollectionHeader h = {StdPool(), nullptr, nullptr, false, nullptr};
-  Released().clear();
-  ReleasedPools().clear();
+  Releases().clear();
   EXPECT_EQ(coffer::SetFreeValFn(&h, RecordRelease), nullptr);
   EXPECT_EQ(coffer::SetMpFreeValFn(&h, RecordMpRelease), nullptr);  // not the cleared one
   EXPECT_EQ(h.freeValFn, nullptr);
@@ -84,8 +83,7 @@ TEST(PoolConventions, SettersKeepAtMostOneCallbackAndDropUsesIt) {
   coffer::DropValue(&h, 7);
   EXPECT_EQ(coffer::SetFreeValFn(&h, nullptr), RecordRelease);
   coffer::DropValue(&h, 9);  // nobody to tell
-  EXPECT_EQ(Released(), (std::vector<CofferVal>{0, 7}));
-  EXPECT_EQ(ReleasedPools(), (std::vector<MemPool *>{&h.mp, nullptr}));
+  EXPECT_EQ(Releases(), (std::vector<Released>{{0, &h.mp}, {7, nullptr}}));
 }
 
 }  // namespace

@@ -1,105 +1,103 @@
 #include "support/test_pool.h"
 
-#include <gtest/gtest.h>
-
+#include <algorithm>
 #include <cstdlib>
 #include <cstring>
 
 namespace coffer_test {
 
 TestPool::TestPool(uintptr_t base) {
-  std::memset(&record_, 0, sizeof record_);
-  record_.alloc = Alloc;
-  record_.calloc = Calloc;
-  record_.realloc = Realloc;
-  record_.free = Free;
-  record_.base = reinterpret_cast<void *>(base);
-  record_.lock = this;
+  record_ = MemPool{Alloc, Calloc, Realloc, Free, reinterpret_cast<void *>(base), this};
 }
 
 TestPool::~TestPool() {
-  for (auto &b : live_) std::free(b.first);
+  for (auto &b : blocks_) std::free(b.first);
 }
 
 size_t TestPool::SizeOf(const void *p) const {
-  auto it = live_.find(const_cast<void *>(p));
-  return it == live_.end() ? 0 : it->second;
+  auto it = blocks_.find(const_cast<void *>(p));
+  return it == blocks_.end() ? 0 : it->second;
 }
 
-TestPool *TestPool::From(MemPool *pool) { return static_cast<TestPool *>(pool->lock); }
-
 bool TestPool::Refuse() {
-  long n = calls_++;
-  return n == failAt_ || (failFrom_ >= 0 && n >= failFrom_);
+  if (calls_++ != failAt_) return false;
+  lastRefused_ = failAt_;
+  return true;
 }
 
 void *TestPool::Alloc(MemPool *pool, size_t size) {
   TestPool *tp = From(pool);
+  LogCall("a" + std::to_string(size));
   if (tp->Refuse()) return nullptr;
   void *p = std::malloc(size ? size : 1);
-  tp->live_[p] = size;
+  tp->blocks_[p] = size;
   return p;
 }
 
 void *TestPool::Calloc(MemPool *pool, size_t count, size_t size) {
   TestPool *tp = From(pool);
+  LogCall("c" + std::to_string(count) + "x" + std::to_string(size));
   if (tp->Refuse()) return nullptr;
-  void *p = std::calloc(count ? count : 1, size ? size : 1);
-  tp->live_[p] = count * size;
+  void *p = std::calloc(1, count * size != 0 ? count * size : 1);
+  tp->blocks_[p] = count * size;
   return p;
 }
 
 void *TestPool::Realloc(MemPool *pool, void *ptr, size_t size) {
   TestPool *tp = From(pool);
+  LogCall((ptr ? "r" : "r0:") + std::to_string(size));
+  if (ptr && !tp->blocks_.count(ptr)) tp->misuse += "realloc of a block not held; ";
   if (size == 0) {
-    Free(pool, ptr);
+    if (ptr) std::free(ptr), tp->blocks_.erase(ptr);
     return nullptr;
   }
-  if (ptr && !tp->IsLive(ptr)) ADD_FAILURE() << "realloc of a block this pool does not hold";
   if (tp->Refuse()) return nullptr;
   void *p = std::malloc(size);
   if (ptr) {
-    size_t old = tp->live_[ptr];
-    std::memcpy(p, ptr, old < size ? old : size);
-    tp->live_.erase(ptr);
+    std::memcpy(p, ptr, std::min(tp->blocks_[ptr], size));
+    tp->blocks_.erase(ptr);
     std::free(ptr);
   }
-  tp->live_[p] = size;
+  tp->blocks_[p] = size;
   return p;
 }
 
 void TestPool::Free(MemPool *pool, void *ptr) {
-  if (!ptr) return;
-  // Read everything before the release: the record may be inside the block.
+  // Everything is read before the release: the record may lie in the block.
   TestPool *tp = From(pool);
-  auto it = tp->live_.find(ptr);
-  if (it == tp->live_.end()) {
-    ADD_FAILURE() << "free of a block this pool does not hold";
-    return;
-  }
-  tp->live_.erase(it);
-  tp->frees_++;
+  LogCall(ptr ? "f" : "f0");
+  if (!ptr) return;
+  if (!tp->blocks_.erase(ptr)) return void(tp->misuse += "free of a block not held; ");
   std::free(ptr);
 }
 
-std::vector<CofferVal> &Released() {
-  static std::vector<CofferVal> log;
+namespace {
+std::string g_log;
+bool g_logging = false;
+}  // namespace
+
+void StartCallLog() { g_log.clear(), g_logging = true; }
+std::string TakeCallLog() {
+  g_logging = false;
+  return std::move(g_log);
+}
+void LogCall(const std::string &entry) {
+  if (g_logging) g_log += (g_log.empty() ? "" : " ") + entry;
+}
+
+std::vector<Released> &Releases() {
+  static std::vector<Released> log;
   return log;
 }
-
-std::vector<MemPool *> &ReleasedPools() {
-  static std::vector<MemPool *> log;
-  return log;
+std::vector<CofferVal> ReleasedVals() {
+  std::vector<CofferVal> v;
+  for (const Released &r : Releases()) v.push_back(r.val);
+  return v;
 }
-
-void RecordRelease(CofferVal val) {
-  Released().push_back(val);
-  ReleasedPools().push_back(nullptr);
-}
-
+void RecordRelease(CofferVal val) { RecordMpRelease(nullptr, val); }
 void RecordMpRelease(MemPool *pool, CofferVal val) {
-  Released().push_back(val);
-  ReleasedPools().push_back(pool);
+  Releases().push_back({val, pool});
+  LogCall("v" + std::to_string(val));
 }
 
 }  // namespace coffer_test

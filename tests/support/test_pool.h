@@ -1,24 +1,22 @@
-// Test helpers shared by every subsystem's tests: a caller-supplied pool that
-// counts, checks and refuses allocations on demand, and value-release logs.
-#ifndef COFFER_TESTS_TEST_POOL_H
-#define COFFER_TESTS_TEST_POOL_H
+// The caller-supplied pool of the tests, and the log of released values.
+// Nothing here depends on GoogleTest, so the fuzz targets use it too.
+#ifndef COFFER_TESTS_SUPPORT_TEST_POOL_H
+#define COFFER_TESTS_SUPPORT_TEST_POOL_H
 
 #include <coffer/mempool.h>
 
-#include <cstddef>
 #include <map>
+#include <string>
 #include <vector>
 
 namespace coffer_test {
 
-// A pool over malloc. The record it hands out keeps a pointer to this object
-// in its lock word (containers copy the record, and a custom pool may use
-// that word as it likes), so every copy reaches the same bookkeeping.
-//
-// Allocation calls (alloc, calloc, and realloc with a nonzero size) are
-// numbered from 0; FailAt(n) makes call n return null, FailFrom(n) makes
-// call n and every later one return null. A refused realloc keeps its block.
-// base is nonzero by default so that offsets differ from addresses.
+// A pool over malloc that numbers its allocation calls (alloc, calloc, and
+// realloc to a nonzero size) from 0 and refuses the ones it is told to. It
+// knows every block it handed out, so a leak or a release of a block it does
+// not hold (a double release) shows. The record keeps a pointer to the pool
+// in its lock word, which every copy of the record carries along. base is
+// nonzero, so offsets differ from addresses.
 class TestPool {
  public:
   explicit TestPool(uintptr_t base = 0x1000);
@@ -27,19 +25,16 @@ class TestPool {
   TestPool &operator=(const TestPool &) = delete;
 
   MemPool *pool() { return &record_; }
+  void FailAt(long n) { failAt_ = n; }  // refuse call n only; -1 for none
+  long calls() const { return calls_; }
+  long lastRefused() const { return lastRefused_; }  // -1 before any refusal
+  size_t held() const { return blocks_.size(); }
+  size_t SizeOf(const void *p) const;  // 0 for a block not held
 
-  void FailAt(long n) { failAt_ = n, failFrom_ = -1; }
-  void FailFrom(long n) { failFrom_ = n, failAt_ = -1; }
-  void NeverFail() { failAt_ = failFrom_ = -1; }
-
-  long calls() const { return calls_; }  // allocation calls so far
-  long frees() const { return frees_; }  // non-null frees so far
-  size_t liveBlocks() const { return live_.size(); }
-  bool IsLive(const void *p) const { return live_.count(const_cast<void *>(p)) != 0; }
-  size_t SizeOf(const void *p) const;  // size of a live block, 0 otherwise
+  std::string misuse;  // what the pool was wrongly asked to do
 
  private:
-  static TestPool *From(MemPool *pool);
+  static TestPool *From(MemPool *pool) { return static_cast<TestPool *>(pool->lock); }
   static void *Alloc(MemPool *pool, size_t size);
   static void *Calloc(MemPool *pool, size_t count, size_t size);
   static void *Realloc(MemPool *pool, void *ptr, size_t size);
@@ -47,16 +42,26 @@ class TestPool {
   bool Refuse();
 
   MemPool record_;
-  long calls_ = 0;
-  long frees_ = 0;
-  long failAt_ = -1;
-  long failFrom_ = -1;
-  std::map<void *, size_t> live_;
+  long calls_ = 0, failAt_ = -1, lastRefused_ = -1;
+  std::map<void *, size_t> blocks_;
 };
 
-// Value-release logs: the callbacks append the values they receive.
-std::vector<CofferVal> &Released();
-std::vector<MemPool *> &ReleasedPools();
+// While logging, one text of pool calls and value releases in the order they
+// happened: aN alloc, cKxN calloc, rN realloc (r0:N from null), f free,
+// vN a released value. StartCallLog clears it; TakeCallLog hands it over
+// and stops.
+void StartCallLog();
+std::string TakeCallLog();
+void LogCall(const std::string &entry);
+
+// Every value a release callback received; the pool argument of the MpFreeValFn kind, or null.
+struct Released {
+  CofferVal val;
+  MemPool *pool;
+  bool operator==(const Released &o) const { return val == o.val && pool == o.pool; }
+};
+std::vector<Released> &Releases();
+std::vector<CofferVal> ReleasedVals();
 void RecordRelease(CofferVal val);
 void RecordMpRelease(MemPool *pool, CofferVal val);
 

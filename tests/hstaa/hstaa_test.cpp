@@ -1,0 +1,57 @@
+// The associative arrays' sharp edges: how keys are classified, paths that
+// name nothing, and propagation modes that change nothing.
+#include <coffer/hstaa.h>
+#include <gtest/gtest.h>
+
+#include <cstring>
+
+namespace {
+
+TEST(Hstaa, KeyClasses) {
+  const struct {
+    const char *key, *rep;
+    bool isRep;
+  } kKeys[] = {{"#", nullptr, true},    {"##", nullptr, true}, {"#0", "#", false},
+               {"#!", "#", false},      {"# ", "#", false},    {"#abc", "#", false},
+               {"##0", "##", false},    {"###", "##", false},  {"", nullptr, false},
+               {"a#", nullptr, false},  {"#\x80", "#", false}};
+  for (const auto &k : kKeys) {
+    const char *rep = HSTAA_GetArrayRep(k.key);
+    EXPECT_EQ(rep ? std::string(rep) : "-", k.rep ? k.rep : "-") << k.key;
+    EXPECT_EQ(HSTAA_IsArrayRep(k.key), k.isRep) << k.key;
+    EXPECT_EQ(HSTAA_IsArrayIndex(k.key), k.rep != nullptr) << k.key;
+  }
+  EXPECT_EQ(HSTAA_GetArrayRep("#1"), HSTAA_GetArrayRep("#x"));  // one string per mark
+  EXPECT_EQ(HSTAA_GetArrayRep("##1"), HSTAA_GetArrayRep("###"));
+}
+
+bool Add(HstaaTree *, CofferVal cur, CofferVal op, CofferVal *out) { return *out = cur + op, true; }
+
+// An empty absolute path has no first character to skip and names nothing;
+// a mode other than insertion and removal visits the elements and changes
+// nothing.
+TEST(Hstaa, PathsThatNameNothingAndIdleModes) {
+  HstaaTree t;
+  std::memset(&t, 0, sizeof t);
+  MemPool_InitOnStdHeap(&t.hst.mp);
+  t.insertValFn = t.removeValFn = Add;
+  t.cloneValFn = [](HstTree *, CofferVal v, CofferVal *out) { return *out = v, true; };
+  ASSERT_TRUE(HST_CreateTreeData(&t.hst, '/', 0, 1, 1));
+  HstNode *root = HST_GetRoot(&t.hst);
+  bool complete = true;
+  EXPECT_EQ(HSTAA_FindPrefix(&t, "", &complete), root);
+  EXPECT_FALSE(complete);
+  EXPECT_EQ(HSTAA_Insert(&t, "", 1), nullptr);
+  EXPECT_TRUE(HSTAA_Remove(&t, "", 1));
+  ASSERT_NE(HSTAA_Insert(&t, "/l/#1/p", 1), nullptr);
+  HstNode *l = HST_Find(&t.hst, "/l");
+  HstNode *rep = HST_InsertChild(&t.hst, l, "#", 0);
+  char rest[] = "p";
+  EXPECT_TRUE(HSTAAPropagateVal(&t, 2, l, rep, rest, 5));
+  EXPECT_TRUE(HSTAAPropagateVal(&t, HSTAA_PROPAGATE_INSERT, l, HST_Find(&t.hst, "/l/#1"), rest, 5));
+  EXPECT_EQ(HST_GetVal(&t.hst, HST_Find(&t.hst, "/l/#1/p")), 1u);
+  EXPECT_EQ(HSTAA_GetSubtreeValCount(&t, root), 1);
+  HST_FreeTree(&t.hst);
+}
+
+}  // namespace

@@ -1,0 +1,107 @@
+// The red-black trees' sharp edges: the order of pool calls and releases,
+// what a release callback sees, sentinels that travel with a swap, and the
+// checker firing on damaged trees.
+#include <gtest/gtest.h>
+
+#include <functional>
+
+#include "rbt/rbt_internal.h"
+#include "support/test_pool.h"
+
+namespace coffer_test {
+namespace {
+
+TEST(Rbt, PoolCallsAndReleasesInOrder) {
+  TestPool tp;
+  RbtNode mine;
+  StartCallLog();
+  RbtTree *s = RBT_AllocTreeEx(tp.pool());
+  RBT_SetFreeValFn(s, RecordRelease);
+  RBT_Insert(s, "b", 1);
+  RBT_InsertNoAlloc(s, &mine, "a", 2);
+  EXPECT_EQ(RBT_Insert(s, nullptr, 3), nullptr);
+  RBT_FreeTree(s);
+  RbtTree *i = RbtInt32_AllocTreeWithNil(tp.pool(), &mine);
+  RbtInt32_SetFreeValFn(i, RecordRelease);
+  RbtInt32_Insert(i, 5, 4);
+  RbtInt32_Insert(i, 5, 5);
+  RbtInt32_Clear(i);
+  RbtInt32_FreeTree(i);
+  EXPECT_EQ(TakeCallLog(),
+            "c1x40 c1x16 c1x24 a2 c1x24 a2 v2 f v1 f f f f f "  // the caller's node stays
+            "c1x40 c1x16 c1x24 c1x24 v4 f v5 f f f");
+  EXPECT_EQ(tp.held(), 0u);
+}
+
+// A value is dropped while its node is still linked and counted.
+RbtTree *g_tree;
+std::vector<int32_t> g_sizes;
+TEST(Rbt, ReleaseSeesTheNodeStillInTheTree) {
+  g_tree = RbtVoidPtr_AllocTree();
+  RbtVoidPtr_SetFreeValFn(g_tree, [](CofferVal v) {
+    g_sizes.push_back(RbtVoidPtr_GetSize(g_tree));
+    g_sizes.push_back(RbtVoidPtr_Find(g_tree, reinterpret_cast<void *>(v)) != nullptr);
+  });
+  for (uintptr_t k = 1; k <= 3; k++) RbtVoidPtr_Insert(g_tree, reinterpret_cast<void *>(k), k);
+  RbtVoidPtr_Remove(g_tree, RbtVoidPtr_Find(g_tree, reinterpret_cast<void *>(2)));
+  RbtVoidPtr_FreeTree(g_tree);
+  EXPECT_EQ(g_sizes, (std::vector<int32_t>{3, 1, 2, 1, 1, 1}));
+}
+
+// ownsNil travels with the sentinel, so neither free releases the caller's
+// sentinel nor leaks the tree's own.
+TEST(Rbt, SwapCarriesTheSentinelAndItsOwnership) {
+  TestPool tp;
+  RbtNode nil;
+  RbtTree *own = RBT_AllocTreeEx(tp.pool()), *lent = RBT_AllocTreeWithNil(tp.pool(), &nil);
+  RBT_Insert(own, "x", 1);
+  RBT_Swap(own, lent);
+  EXPECT_EQ(RBT_GetSize(own), 0);
+  EXPECT_STREQ(coffer::RecordAt<char>(lent, RBT_First(lent)->key), "x");
+  RBT_FreeTree(own);
+  RBT_FreeTree(lent);
+  EXPECT_EQ(tp.held(), 0u);
+  EXPECT_EQ(tp.misuse, "");
+}
+
+TEST(Rbt, CheckerFiresOnEachDamage) {
+  RbtTree *t = RbtInt32_AllocTree();
+  for (int32_t k : {4, 2, 6, 1, 3, 5, 7, 8}) RbtInt32_Insert(t, k, 0);
+  auto *d = static_cast<RbtTreeData *>(t->data);
+  auto node = [&](int32_t k) { return RbtInt32_Find(t, k); };
+  const struct {
+    const char *what;
+    std::function<void()> damage;
+  } kDamage[] = {
+      {"sentinel changed", [&] { coffer::RecordAt<RbtNode>(t, d->nil)->color = 1; }},
+      {"red root", [&] { node(4)->color = 1; }},
+      {"red node with a red child", [&] { node(7)->color = 1; }},
+      {"black heights differ", [&] { node(1)->color = 1 - node(1)->color; }},
+      {"colour neither red nor black", [&] { node(5)->color = 2; }},
+      {"parent link disagrees with child link", [&] { node(3)->parent = d->nil; }},
+      {"keys out of order", [&] { node(3)->key = 9; }},
+      {"more nodes than size counts", [&] { d->size = 2; }},
+      {"size differs from the nodes reachable", [&] { d->size = 9; }},
+      {"a link is 0 instead of the sentinel", [&] { node(8)->left = 0; }},
+  };
+  coffer::CheckFault fault;
+  for (const auto &row : kDamage) {
+    std::vector<RbtNode> saved;
+    for (int32_t k = 1; k <= 8; k++) saved.push_back(*node(k));
+    const RbtTreeData savedData = *d;
+    const RbtNode savedNil = *coffer::RecordAt<RbtNode>(t, d->nil);
+    ASSERT_TRUE(coffer::RBTCheckTree(t, coffer::kRbtInt32Keys, &fault));
+    std::vector<RbtNode *> nodes;
+    for (int32_t k = 1; k <= 8; k++) nodes.push_back(node(k));
+    row.damage();
+    EXPECT_FALSE(coffer::RBTCheckTree(t, coffer::kRbtInt32Keys, &fault)) << row.what;
+    EXPECT_STREQ(fault.what, row.what);
+    *d = savedData;
+    *coffer::RecordAt<RbtNode>(t, d->nil) = savedNil;
+    for (size_t i = 0; i < nodes.size(); i++) *nodes[i] = saved[i];
+  }
+  RbtInt32_FreeTree(t);
+}
+
+}  // namespace
+}  // namespace coffer_test

@@ -1,0 +1,42 @@
+#include "support/driver.h"
+
+#include <random>
+
+namespace coffer_test {
+
+uint32_t Ops::Take(uint32_t n) {
+  uint32_t v = 0;
+  for (uint32_t span = 1; span < n && p_ < end_; span <<= 8) v = v << 8 | *p_++;
+  return n ? v % n : 0;
+}
+
+std::string Ops::Key(const std::string &alphabet, uint32_t maxLen) {
+  std::string k;
+  for (uint32_t n = Take(maxLen + 1); n; --n) k += alphabet[Take(alphabet.size())];
+  return k;
+}
+
+std::vector<uint8_t> RandomBytes(uint32_t seed, size_t n) {
+  std::mt19937 rng(seed);
+  std::vector<uint8_t> v(n);
+  for (uint8_t &b : v) b = static_cast<uint8_t>(rng());
+  return v;
+}
+
+std::string Differs(const char *file, int line, const char *what) {
+  return std::string(file) + ":" + std::to_string(line) + ": " + what;
+}
+
+std::string ForEachFailure(const std::function<std::string(Arena)> &run) {
+  for (long n = 0;; n++) {
+    TestPool tp;
+    tp.FailAt(n);
+    std::string e = run(Arena{tp.pool(), &tp});
+    if (e.empty() && tp.held()) e = std::to_string(tp.held()) + " blocks leaked";
+    if (e.empty()) e = tp.misuse;
+    if (!e.empty()) return "refusing call " + std::to_string(n) + ": " + e;
+    if (tp.calls() <= n) return "";
+  }
+}
+
+}  // namespace coffer_test

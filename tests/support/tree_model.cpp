@@ -1,0 +1,439 @@
+// The string tree and the associative arrays against one reference tree
+// (children in a std::map, whose byte order is strcmp's), compared node by
+// node after every step together with the exact sequence of callbacks.
+#include <coffer/hstaa.h>
+
+#include <cstdio>
+#include <cstring>
+#include <map>
+#include <memory>
+
+#include "hst/hst_internal.h"
+#include "support/driver.h"
+
+namespace coffer_test {
+namespace {
+
+struct MNode {
+  MNode(std::string k, CofferVal v) : key(std::move(k)), val(v) {}
+  std::string key;
+  CofferVal val;
+  int32_t count = 0;  // the string tree's subtreeValCount; the arrays derive theirs
+  int held = 0;       // arrays: accepted insertions less accepted removals here
+  MNode *parent = nullptr;
+  std::map<std::string, std::unique_ptr<MNode>> kids;
+  HstNode *lib = nullptr;  // the library's node, once compared
+};
+
+int Nodes(const MNode *n) {
+  int c = 1;
+  for (auto &k : n->kids) c += Nodes(k.second.get());
+  return c;
+}
+int Held(const MNode *n) {
+  int c = n->held;
+  for (auto &k : n->kids) c += Held(k.second.get());
+  return c;
+}
+void Collect(MNode *n, std::vector<MNode *> *all) {
+  all->push_back(n);
+  for (auto &k : n->kids) Collect(k.second.get(), all);
+}
+MNode *Child(MNode *n, const std::string &k) {
+  auto it = n->kids.find(k);
+  return it == n->kids.end() ? nullptr : it->second.get();
+}
+MNode *Attach(MNode *parent, std::unique_ptr<MNode> n, const std::string &key) {
+  n->key = key;
+  n->parent = parent;
+  return (parent->kids[key] = std::move(n)).get();
+}
+
+// Every callback and release, in order: I(nsert) and R(emove) of an operand
+// at a value, C(lone) of a value, F a released value.
+std::vector<std::string> g_log;
+struct Behaviour {
+  int refuseOperand = -1, refuseAt = -1, refuseClone = -1;
+} g_b;
+bool Apply(char what, CofferVal cur, CofferVal op, CofferVal *out) {
+  g_log.push_back(what + std::to_string(cur) + "," + std::to_string(op));
+  if (what == 'C') {  // the copy of value v is v + 1000, so copies show
+    if (static_cast<int>(cur % 1000) == g_b.refuseClone) return false;
+    *out = cur + 1000;
+  } else if (what == 'R') {  // a node's value counts what it holds
+    if (cur % 1000 == 0) return false;
+    *out = cur - 1;
+  } else {
+    if (static_cast<int>(op) == g_b.refuseOperand || static_cast<int>(cur) == g_b.refuseAt) return false;
+    *out = cur + 1;
+  }
+  return true;
+}
+bool CloneVal(HstTree *, CofferVal v, CofferVal *out) { return Apply('C', v, 0, out); }
+void Release(CofferVal v) { g_log.push_back("F" + std::to_string(v)); }
+
+// The library's tree against the model's, node by node; wires up lib.
+std::string Compare(HstTree *t, HstNode *h, MNode *m, bool derived, TestPool *tp) {
+  m->lib = h;
+  MODEL_EXPECT(HST_GetKey(t, h) == m->key && HST_GetVal(t, h) == m->val);
+  MODEL_EXPECT(!tp || tp->SizeOf(HST_GetKey(t, h)) == m->key.size() + 1);
+  MODEL_EXPECT(h->subtreeValCount == (derived ? Held(m) : m->count));
+  MODEL_EXPECT(HST_GetNumChildren(t, h) == static_cast<int32_t>(m->kids.size()));
+  int32_t i = 0;
+  for (auto &k : m->kids) {
+    HstNode *c = HST_GetChild(t, h, i++);
+    MODEL_EXPECT(c && HST_GetParent(t, c) == h);
+    MODEL_TRY(Compare(t, c, k.second.get(), derived, tp));
+  }
+  MODEL_EXPECT(HST_GetChild(t, h, i) == nullptr && HST_GetChild(t, h, -1) == nullptr);
+  return "";
+}
+std::string CompareTree(HstTree *t, MNode *root, bool derived, TestPool *tp) {
+  MODEL_EXPECT(HST_GetParent(t, HST_GetRoot(t)) == nullptr && HST_GetSize(t) == Nodes(root));
+  coffer::CheckFault fault;
+  MODEL_EXPECT(coffer::hst::HSTCheckTree(t, derived, &fault));
+  return Compare(t, HST_GetRoot(t), root, derived, tp);
+}
+
+// Path text over names that never hold the separator, now and then with a
+// separator at the end; the first character is never examined.
+struct Path {
+  std::vector<std::string> names;
+  std::string text;
+};
+Path MakePath(Ops &ops, char sep, const std::vector<std::string> &names) {
+  Path p;
+  for (uint32_t d = ops.Take(4); d; --d) {
+    std::string k = names[ops.Take(names.size())];
+    if (sep && k.find(sep) != std::string::npos) continue;
+    if (!sep && !p.names.empty()) {  // a NUL separator never cuts: one name
+      p.names[0] += k, p.text += k;
+      continue;
+    }
+    p.text += (p.names.empty() ? "" : std::string(1, sep)) + k;
+    p.names.push_back(k);
+  }
+  if (!sep && !p.names.empty() && p.names[0].empty()) p.names.clear();
+  // An empty last name needs a separator after it to be seen; any other may
+  // have one, which ends the walk all the same.
+  if (sep && !p.names.empty() && (p.names.back().empty() || ops.Take(5) == 0)) p.text += sep;
+  return p;
+}
+
+MNode *Lookup(MNode *n, const std::vector<std::string> &names) {
+  for (const std::string &k : names)
+    if (!(n = Child(n, k))) return nullptr;
+  return n;
+}
+HstNode *LibOf(MNode *n) { return n ? n->lib : nullptr; }
+
+std::unique_ptr<MNode> New(CofferVal val) { return std::make_unique<MNode>("", val); }
+
+// What releasing n's subtree logs: children in name order, each before its
+// parent.
+void LogReleases(const MNode *n, std::vector<std::string> *log) {
+  for (auto &k : n->kids) LogReleases(k.second.get(), log);
+  log->push_back("F" + std::to_string(n->val));
+}
+
+// The string tree's copy of n: values other than the default through the
+// clone callback (v becomes v + 1000), counts as they were.
+std::unique_ptr<MNode> Copy(const MNode *n, CofferVal dv) {
+  auto c = New(n->val == dv ? dv : n->val + 1000);
+  c->count = n->count;
+  for (auto &k : n->kids) Attach(c.get(), Copy(k.second.get(), dv), k.first);
+  return c;
+}
+
+}  // namespace
+
+std::string RunHstModel(Ops &ops, Arena arena) {
+  static const char kSeps[] = {'/', '.', '\0'};
+  static const std::vector<std::string> kNames = {"a", "b", "ab", "", "/", "."};
+  const char sep = kSeps[ops.Take(3)];
+  const CofferVal dv = ops.Take(2) ? 0 : 7;
+  OpWatch made(arena.tp);
+  HstTree *t = HST_AllocTreeEx(arena.pool, sep, dv, ops.Take(3), ops.Take(4) - 1);
+  if (!t) return made.Refused() ? "" : "creation failed unrefused";
+  HST_SetFreeValFn(t, Release);
+  MNode root{"", dv};
+  MODEL_TRY(CompareTree(t, &root, false, arena.tp));
+  for (CofferVal next = 1; ops.More(); next++) {
+    g_log.clear();
+    std::vector<std::string> want;
+    std::vector<MNode *> all;
+    Collect(&root, &all);
+    MNode *x = all[ops.Take(all.size())], *y = all[ops.Take(all.size())];
+    OpWatch op(arena.tp);
+    const uint32_t kind = ops.Take(16);
+    Path p = MakePath(ops, sep, kNames);
+    const std::string text = (ops.Take(2) ? "/" : "x") + p.text;
+    if (kind < 4) {  // insert at a path: missing names made with the default value
+      HstNode *got = HST_Insert(t, text.c_str(), next);
+      MNode *n = &root;
+      bool whole = true;
+      for (const std::string &k : p.names) {
+        MNode *c = Child(n, k);
+        HstNode *h = HST_FindChild(t, n->lib, k.c_str());
+        if (!c && h) (c = Attach(n, New(dv), k))->lib = h;  // made by this call
+        if (!(whole = c != nullptr)) break;  // refused here: what was made stays
+        n = c;
+      }
+      MODEL_EXPECT(!got == op.Refused() && (!got || (whole && got == n->lib)));
+      if (got) n->val = next;
+    } else if (kind < 6) {  // find, through a path or by name
+      MODEL_EXPECT(HST_Find(t, text.c_str()) == LibOf(Lookup(&root, p.names)));
+      MODEL_EXPECT(HST_FindChild(t, x->lib, p.text.c_str()) == LibOf(Child(x, p.text)));
+    } else if (kind < 8 && !Child(x, p.text)) {  // a new child by name
+      HstNode *got = HST_InsertChild(t, x->lib, p.text.c_str(), next);
+      MODEL_EXPECT(!got == op.Refused());
+      if (got) Attach(x, New(next), p.text);
+    } else if (kind < 10) {  // remove a subtree; the root's empties the tree
+      LogReleases(x, &want);
+      HST_RemoveSubtree(t, x->lib);
+      if (x == &root) root.kids.clear(), root.val = dv, root.count = 0;
+      if (x != &root) x->parent->kids.erase(x->key);
+    } else if (kind < 12 && x != &root) {  // copy x's subtree under y, maybe renamed
+      const std::string key = ops.Take(2) ? p.text : x->key;
+      g_b.refuseClone = ops.Take(3) ? -1 : static_cast<int>(ops.Take(next) % 1000);
+      if (Child(y, key)) continue;  // sibling names stay unique
+      std::vector<MNode *> src;
+      Collect(x, &src);
+      std::vector<std::string> clones;  // parents first, siblings in name order
+      bool refuses = false;
+      for (MNode *n : src) {
+        if (n->val == dv || refuses) continue;
+        clones.push_back("C" + std::to_string(n->val) + ",0");
+        refuses = static_cast<int>(n->val % 1000) == g_b.refuseClone;
+      }
+      HstNode *got = HST_CloneSubtree(t, x->lib, CloneVal, key == x->key ? nullptr : key.c_str(), y->lib);
+      MODEL_EXPECT(!got == (op.Refused() || refuses));
+      // A failed copy releases every value it made, and only those.
+      std::map<CofferVal, int> copies;
+      std::vector<std::string> calls;
+      for (const std::string &e : g_log) {
+        CofferVal v = std::stoul(e.substr(1));
+        if (e[0] == 'C') calls.push_back(e);
+        if (e[0] == 'C' && static_cast<int>(v % 1000) != g_b.refuseClone) copies[v + 1000]++;
+        if (e[0] == 'F' && v != dv) copies[v]--;
+      }
+      for (auto &c : copies) MODEL_EXPECT(got || c.second == 0);
+      MODEL_EXPECT(!got || g_log == clones);
+      MODEL_EXPECT(calls.size() <= clones.size() && std::equal(calls.begin(), calls.end(), clones.begin()));
+      MODEL_EXPECT(op.Refused() || calls.size() == clones.size());
+      if (got) Attach(y, Copy(x, dv), key);
+      g_b.refuseClone = -1;
+      want = g_log;  // checked above
+    } else if (kind < 13) {  // replace a value: never released
+      HST_SetVal(t, x->lib, next);
+      x->val = next;
+    } else if (kind < 14) {  // the count the arrays keep, carried up to the root
+      int32_t delta = static_cast<int32_t>(ops.Take(5)) - 2;
+      HSTAAAdjustSubtreeValCount(t, x->lib, delta);
+      for (MNode *n = x; n; n = n->parent) n->count += delta;
+    } else if (kind < 15) {  // clear: the root's value goes last
+      LogReleases(&root, &want);
+      HST_Clear(t);
+      root.kids.clear(), root.val = dv, root.count = 0;
+    } else if (arena.tp) {
+      arena.tp->FailAt(arena.tp->calls());
+    }
+    MODEL_EXPECT(g_log == want);
+    MODEL_TRY(CompareTree(t, &root, false, arena.tp));
+  }
+  std::vector<std::string> want;
+  LogReleases(&root, &want);
+  g_log.clear();
+  HST_FreeTree(t);
+  MODEL_EXPECT(g_log == want);
+  return "";
+}
+
+namespace {
+
+// The array a key is an element of: "#", "##", or "" for none.
+std::string MarkOf(const std::string &k) {
+  if (k.size() >= 3 && k[0] == '#' && k[1] == '#') return "##";
+  return k.size() >= 2 && k[0] == '#' && k[1] != '#' ? "#" : "";
+}
+bool IsMark(const std::string &k) { return k == "#" || k == "##"; }
+
+// The associative arrays' algorithms, restated on the reference tree.
+struct AaModel {
+  CofferVal dv;
+  MNode root{"", dv};
+
+  void Drop(MNode *n) {
+    LogReleases(n, &g_log);
+    n->parent->kids.erase(n->key);
+  }
+  // A copy built parent first; a refused value releases the partial copy.
+  std::unique_ptr<MNode> Clone(const MNode *src) {
+    auto n = New(dv);
+    n->held = src->held;
+    if (src->val != dv && !Apply('C', src->val, 0, &n->val)) return nullptr;
+    for (auto &k : src->kids) {
+      auto c = Clone(k.second.get());
+      if (!c) return LogReleases(n.get(), &g_log), nullptr;
+      Attach(n.get(), std::move(c), k.first);
+    }
+    return n;
+  }
+  MNode *Insert(MNode *node, const std::vector<std::string> &p, size_t i, CofferVal val) {
+    MNode *made = nullptr;
+    for (; i < p.size(); i++) {
+      const std::string &k = p[i];
+      MNode *child = Child(node, k);
+      MNode *rep = child || MarkOf(k).empty() ? nullptr : Child(node, MarkOf(k));
+      if (rep) {
+        auto copy = Clone(rep);
+        if (!copy) return nullptr;
+        child = Attach(node, std::move(copy), k);
+      } else if (!child) {
+        child = Attach(node, New(dv), k);
+        if (!made) made = child;
+      }
+      if (IsMark(k)) Propagate(HSTAA_PROPAGATE_INSERT, node, k, p, i + 1, val);
+      node = child;
+    }
+    if (Apply('I', node->val, val, &node->val)) return node->held++, node;
+    if (made) Drop(made);
+    return nullptr;
+  }
+  void Remove(MNode *node, const std::vector<std::string> &p, size_t i, CofferVal val) {
+    if (i == p.size()) {
+      if (Apply('R', node->val, val, &node->val)) node->held--;
+      return;
+    }
+    const std::string &k = p[i];
+    MNode *child = Child(node, k);
+    if (!child) return;
+    if (IsMark(k)) Propagate(HSTAA_PROPAGATE_REMOVE, node, k, p, i + 1, val);
+    Remove(child, p, i + 1, val);
+    MNode *rep = MarkOf(k).empty() ? nullptr : Child(node, MarkOf(k));
+    if (Held(child) == 0 || (rep && Held(rep) == Held(child))) Drop(child);
+  }
+  // Elements follow their template in key order: visit that run only.
+  bool Propagate(int mode, MNode *parent, const std::string &mark,
+                 const std::vector<std::string> &p, size_t i, CofferVal val) {
+    for (std::string at = mark;;) {
+      auto it = parent->kids.upper_bound(at);
+      if (it == parent->kids.end() || MarkOf(it->first) != mark) return true;
+      at = it->first;
+      MNode *e = it->second.get();
+      if (mode == HSTAA_PROPAGATE_INSERT && !Insert(e, p, i, val)) return false;
+      if (mode == HSTAA_PROPAGATE_REMOVE) {
+        Remove(e, p, i, val);
+        if (Held(e) == 0) Drop(e);
+      }
+    }
+  }
+  std::pair<MNode *, bool> FindPrefix(MNode *node, const std::vector<std::string> &p) {
+    for (const std::string &k : p) {
+      MNode *child = Child(node, k);
+      if (!child && !MarkOf(k).empty()) child = Child(node, MarkOf(k));
+      if (!child) return {node, false};
+      node = child;
+    }
+    return {node, true};
+  }
+};
+
+int32_t Counted(HstNode *n) { return n->subtreeValCount; }
+
+// After a refused allocation the arrays keep whatever was done before it:
+// the model takes the library's tree as it stands (its counts were checked).
+std::unique_ptr<MNode> Adopt(HstTree *t, HstNode *h) {
+  auto n = New(HST_GetVal(t, h));
+  n->key = HST_GetKey(t, h);
+  n->held = Counted(h);
+  for (int32_t i = 0; i < HST_GetNumChildren(t, h); i++) {
+    HstNode *c = HST_GetChild(t, h, i);
+    n->held -= Counted(c);
+    Attach(n.get(), Adopt(t, c), HST_GetKey(t, c));
+  }
+  return n;
+}
+
+}  // namespace
+
+std::string RunHstaaModel(Ops &ops, Arena arena) {
+  static const std::vector<std::string> kKeys = {"a", "", "#", "##", "#1", "#2", "#!", "# ", "##1", "###", "#", "##", "#1"};
+  AaModel m{ops.Take(2) ? CofferVal{0} : CofferVal{1000}};
+  g_b = Behaviour{static_cast<int>(ops.Take(6)) - 1, static_cast<int>(ops.Take(4)) - 1, static_cast<int>(ops.Take(4)) - 1};
+  HstaaTree tree;
+  std::memset(&tree, 0, sizeof tree);
+  tree.hst.mp = *arena.pool;
+  tree.cloneValFn = CloneVal;
+  tree.insertValFn = [](HstaaTree *, CofferVal cur, CofferVal op, CofferVal *out) { return *out == cur && Apply('I', cur, op, out); };
+  tree.removeValFn = [](HstaaTree *, CofferVal cur, CofferVal op, CofferVal *out) { return *out == cur && Apply('R', cur, op, out); };
+  HST_SetFreeValFn(&tree.hst, Release);
+  OpWatch made(arena.tp);
+  if (!HST_CreateTreeData(&tree.hst, '/', m.dv, ops.Take(3), 2)) return made.Refused() ? "" : "creation failed unrefused";
+  HstTree *t = &tree.hst;
+  MODEL_TRY(CompareTree(t, &m.root, true, arena.tp));
+  while (ops.More()) {
+    g_log.clear();
+    std::vector<MNode *> all;
+    Collect(&m.root, &all);
+    MNode *start = ops.Take(3) ? &m.root : all[ops.Take(all.size())];
+    const bool relative = start != &m.root || ops.Take(2);
+    Path p = MakePath(ops, '/', kKeys);
+    const std::string abs = (ops.Take(2) ? "/" : "x") + p.text;
+    char text[64];
+    std::snprintf(text, sizeof text, "%s", p.text.c_str());
+    char *arg = p.text.empty() && ops.Take(2) ? nullptr : text;
+    const CofferVal v = 1 + ops.Take(4);
+    OpWatch op(arena.tp);
+    const uint32_t kind = ops.Take(16);
+    std::vector<std::string> want;
+    bool whole = true;  // the path text must come back as it was
+    HstNode *got = nullptr;
+    MNode *mine = nullptr;
+    if (kind < 7) {
+      got = relative ? HSTAAInsert(&tree, start->lib, arg, v) : HSTAA_Insert(&tree, abs.c_str(), v);
+      std::swap(want, g_log);
+      mine = m.Insert(start, p.names, 0, v);
+      std::swap(want, g_log);
+      if (op.Refused()) {  // (a refusal inside an element does not stop the insertion)
+        coffer::CheckFault fault;
+        MODEL_EXPECT(coffer::hst::HSTCheckTree(t, true, &fault));
+        m.root.kids.clear();
+        m.root = std::move(*Adopt(t, HST_GetRoot(t)));
+        for (auto &k : m.root.kids) k.second->parent = &m.root;
+        want = g_log;
+        got = nullptr;
+        mine = nullptr;
+      }
+    } else if (kind < 13) {
+      if (relative)
+        HSTAARemove(&tree, start->lib, arg, v);
+      else
+        MODEL_EXPECT(HSTAA_Remove(&tree, abs.c_str(), v));
+      std::swap(want, g_log);
+      m.Remove(start, p.names, 0, v);
+      std::swap(want, g_log);
+    } else if (kind < 15) {
+      bool complete = !ops.Take(2);
+      HstNode *got = relative ? HSTAAFindPrefix(&tree, start->lib, arg, &complete) : HSTAA_FindPrefix(&tree, abs.c_str(), &complete);
+      auto found = m.FindPrefix(start, p.names);
+      MODEL_EXPECT(got == found.first->lib && complete == found.second);
+      whole = found.second;  // else the unresolved name stays cut
+    } else if (arena.tp) {
+      arena.tp->FailAt(arena.tp->calls());
+    }
+    MODEL_EXPECT(!whole || p.text == text);
+    MODEL_EXPECT(g_log == want);
+    MODEL_TRY(CompareTree(t, &m.root, true, arena.tp));
+    MODEL_EXPECT(got == LibOf(mine));  // the node inserted at, once wired up
+  }
+  std::vector<std::string> want;
+  LogReleases(&m.root, &want);
+  g_log.clear();
+  HST_FreeTree(t);
+  MODEL_EXPECT(g_log == want);
+  g_b = Behaviour{};
+  return "";
+}
+
+}  // namespace coffer_test
