@@ -1,5 +1,7 @@
 #include "support/driver.h"
 
+#include <cstdio>
+#include <cstdlib>
 #include <random>
 
 namespace coffer_test {
@@ -37,6 +39,16 @@ std::string ForEachFailure(const std::function<std::string(Arena)> &run) {
     if (!e.empty()) return "refusing call " + std::to_string(n) + ": " + e;
     if (tp.calls() <= n) return "";
   }
+}
+
+int FuzzModel(std::string (*run)(Ops &, Arena), const uint8_t *data, size_t size) {
+  TestPool tp;
+  Ops ops(data, size);
+  std::string e = run(ops, Arena{tp.pool(), &tp});
+  if (e.empty() && tp.held()) e = std::to_string(tp.held()) + " blocks leaked";
+  if (e.empty()) e = tp.misuse;
+  if (!e.empty()) std::fprintf(stderr, "%s\n", e.c_str()), std::abort();
+  return 0;
 }
 
 }  // namespace coffer_test

@@ -73,6 +73,10 @@ std::string RunHstaaModel(Ops &ops, Arena arena);
 // double release.
 std::string ForEachFailure(const std::function<std::string(Arena)> &run);
 
+// A fuzz target's body: runs a model on the fuzzer's bytes over a TestPool
+// and aborts, saying why, on any disagreement, leak or double release.
+int FuzzModel(std::string (*run)(Ops &, Arena), const uint8_t *data, size_t size);
+
 }  // namespace coffer_test
 
 #endif

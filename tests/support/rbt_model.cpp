@@ -12,15 +12,23 @@
 namespace coffer_test {
 namespace {
 
-#define FAMILY_CALLS(P)                                                                    \
-  static constexpr auto allocEx = P##_AllocTreeEx, freeTree = P##_FreeTree;                    \
-  static constexpr auto allocWithNil = P##_AllocTreeWithNil;                               \
-  static constexpr auto clear = P##_Clear, swap = P##_Swap;                                \
-  static constexpr auto insert = P##_Insert, insertNoAlloc = P##_InsertNoAlloc;            \
-  static constexpr auto remove = P##_Remove, removeRange = P##_RemoveRange;                \
-  static constexpr auto find = P##_Find, lowerBound = P##_LowerBound;                      \
-  static constexpr auto upperBound = P##_UpperBound, first = P##_First, next = P##_Next;   \
-  static constexpr auto prev = P##_Prev, size = P##_GetSize;                               \
+#define FAMILY_CALLS(P)                                      \
+  static constexpr auto allocEx = P##_AllocTreeEx;           \
+  static constexpr auto allocWithNil = P##_AllocTreeWithNil; \
+  static constexpr auto freeTree = P##_FreeTree;             \
+  static constexpr auto clear = P##_Clear;                   \
+  static constexpr auto swap = P##_Swap;                     \
+  static constexpr auto insert = P##_Insert;                 \
+  static constexpr auto insertNoAlloc = P##_InsertNoAlloc;   \
+  static constexpr auto remove = P##_Remove;                 \
+  static constexpr auto removeRange = P##_RemoveRange;       \
+  static constexpr auto find = P##_Find;                     \
+  static constexpr auto lowerBound = P##_LowerBound;         \
+  static constexpr auto upperBound = P##_UpperBound;         \
+  static constexpr auto first = P##_First;                   \
+  static constexpr auto next = P##_Next;                     \
+  static constexpr auto prev = P##_Prev;                     \
+  static constexpr auto size = P##_GetSize;                  \
   static constexpr auto setFreeValFn = P##_SetFreeValFn;
 
 struct Strings {
