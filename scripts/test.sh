@@ -1,6 +1,7 @@
 #!/usr/bin/env bash
 # Installs what is missing, builds coffer and runs the whole test suite twice:
-# optimised, then under AddressSanitizer and UndefinedBehaviorSanitizer.
+# optimised, then under AddressSanitizer and UndefinedBehaviorSanitizer with
+# the library checking its own invariants after every change.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/setup.sh
@@ -14,4 +15,4 @@ run() {
   ctest --test-dir "$dir" --output-on-failure -j"$jobs"
 }
 run build-release -DCMAKE_BUILD_TYPE=Release
-run build-sanitize -DCMAKE_BUILD_TYPE=Debug -DCOFFER_SANITIZE=ON
+run build-sanitize -DCMAKE_BUILD_TYPE=Debug -DCOFFER_SANITIZE=ON -DCOFFER_CHECKS=ON
