@@ -21,6 +21,7 @@ TEST(Hst, PoolCallsAndReleasesInOrder) {
                    "d", HST_GetRoot(t));
   HST_RemoveSubtree(t, HST_Find(t, "/ab"));
   HST_FreeTree(t);
+  HST_FreeTree(nullptr);
   EXPECT_EQ(TakeCallLog(),
             "c1x40 c1x24 a1 c1x20 "                                // handle, record, root
             "c1x16 r0:8 a3 c1x20 a3 c1x16 r0:8 a2 c1x20 a2 "       // /ab/c

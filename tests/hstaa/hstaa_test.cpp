@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
+#include <functional>
 
 namespace {
 
@@ -53,5 +54,56 @@ TEST(Hstaa, PathsThatNameNothingAndIdleModes) {
   EXPECT_EQ(HSTAA_GetSubtreeValCount(&t, root), 1);
   HST_FreeTree(&t.hst);
 }
+
+#ifndef __SANITIZE_ADDRESS__  // the sanitizer owns malloc there, and finds leaks itself
+// The path calls copy the path with malloc and free the copy before they
+// return; when the copy is refused they fail and change nothing.
+long g_heldBlocks;
+bool g_refuseMalloc;
+}  // namespace
+
+extern "C" void *__libc_malloc(size_t);
+extern "C" void __libc_free(void *);
+extern "C" void *malloc(size_t n) {
+  if (g_refuseMalloc) return g_refuseMalloc = false, nullptr;
+  void *p = __libc_malloc(n);
+  g_heldBlocks += p != nullptr;
+  return p;
+}
+extern "C" void free(void *p) {
+  g_heldBlocks -= p != nullptr;
+  __libc_free(p);
+}
+
+namespace {
+
+TEST(Hstaa, PathCopies) {
+  HstaaTree t;
+  std::memset(&t, 0, sizeof t);
+  MemPool_InitOnStdHeap(&t.hst.mp);
+  t.insertValFn = t.removeValFn = Add;
+  ASSERT_TRUE(HST_CreateTreeData(&t.hst, '/', 0, 1, 1));
+  HstNode *b = HSTAA_Insert(&t, "/a/b", 1);
+  bool complete = false;
+  const std::function<bool()> kCalls[] = {
+      [&] { return HST_Find(&t.hst, "/a/b") == b; },
+      [&] { return HST_Insert(&t.hst, "/a/b", 1) == b; },
+      [&] { return HSTAA_FindPrefix(&t, "/a/b", &complete) == b; },
+      [&] { return HSTAA_Insert(&t, "/a/b", 1) == b; },
+      [&] { return HSTAA_Remove(&t, "/a/b", 9); },
+  };
+  for (const auto &call : kCalls) {
+    const long held = g_heldBlocks;
+    EXPECT_TRUE(call());
+    EXPECT_EQ(g_heldBlocks, held);
+    complete = true;
+    g_refuseMalloc = true;
+    EXPECT_FALSE(call());
+    EXPECT_TRUE(complete);  // not written when the copy is refused
+  }
+  EXPECT_EQ(HST_GetVal(&t.hst, b), 11u);  // 1, set to 1, +1, +9: nothing twice
+  HST_FreeTree(&t.hst);
+}
+#endif
 
 }  // namespace

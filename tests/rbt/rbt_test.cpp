@@ -27,6 +27,9 @@ TEST(Rbt, PoolCallsAndReleasesInOrder) {
   RbtInt32_Insert(i, 5, 5);
   RbtInt32_Clear(i);
   RbtInt32_FreeTree(i);
+  RBT_FreeTree(nullptr);
+  RbtInt32_FreeTree(nullptr);
+  RbtVoidPtr_FreeTree(nullptr);
   EXPECT_EQ(TakeCallLog(),
             "c1x40 c1x16 c1x24 a2 c1x24 a2 v2 f v1 f f f f f "  // the caller's node stays
             "c1x40 c1x16 c1x24 c1x24 v4 f v5 f f f");
