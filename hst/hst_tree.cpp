@@ -60,7 +60,6 @@ COFFER_API void HST_RemoveSubtree(HstTree *tree, HstNode *node) {
 
 COFFER_API void HST_Clear(HstTree *tree) {
   HST_CHECKED(tree);
-  HstTreeData *data = Data(tree);
   HstNode *root = HST_GetRoot(tree);
   const int32_t n = HST_GetNumChildren(tree, root);
   for (int32_t i = 0; i < n; i++) HSTFreeSubtree(tree, HST_GetChild(tree, root, i));
@@ -72,9 +71,10 @@ COFFER_API void HST_Clear(HstTree *tree) {
   HSTFreeVal(tree, root->val);
   // The root starts over as at creation; its old value is gone, so a later
   // clear or free must not see it again.
-  root->val = data->defaultVal;
+  // size needs no reset: every node released above counted itself out, so
+  // it reads 1, the root, as on a fresh tree.
+  root->val = Data(tree)->defaultVal;
   root->subtreeValCount = 0;
-  data->size = 1;
 }
 
 COFFER_API void HST_FreeTree(HstTree *tree) {

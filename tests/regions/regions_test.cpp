@@ -3,6 +3,9 @@
 // once every container is gone.
 #include <coffer/platform.h>
 #include <gtest/gtest.h>
+#include <sys/mman.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include "support/driver.h"
 
@@ -27,6 +30,24 @@ TEST(Regions, EveryFamilyAgreesWithItsModelInARegion) {
       EXPECT_EQ(region[4], size - 16) << name << " seed " << seed;  // the whole region
     }
   Tandel_DestroyExclLock(&lock);
+}
+
+// The lock of a holder that died is recovered and then held by the next
+// acquirer, which the pools rely on to go on with the region.
+TEST(Regions, LockOfADeadHolderIsRecovered) {
+  auto *lock = static_cast<TandelExclLock *>(
+      mmap(nullptr, sizeof(TandelExclLock), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0));
+  ASSERT_EQ(Tandel_InitExclLock(lock), 0);
+  EXPECT_EQ(Tandel_AcquireExclLock(lock), 0);
+  EXPECT_EQ(Tandel_ReleaseExclLock(lock), 0);
+  pid_t child = fork();
+  if (child == 0) _exit(Tandel_AcquireExclLock(lock));  // dies holding it
+  int status;
+  ASSERT_EQ(waitpid(child, &status, 0), child);
+  EXPECT_EQ(Tandel_AcquireExclLock(lock), 0);
+  EXPECT_EQ(Tandel_ReleaseExclLock(lock), 0);
+  EXPECT_EQ(Tandel_DestroyExclLock(lock), 0);
+  munmap(lock, sizeof *lock);
 }
 
 }  // namespace
