@@ -1,7 +1,9 @@
 #!/usr/bin/env bash
 # Installs what is missing, builds coffer and runs the whole test suite twice:
 # optimised, then under AddressSanitizer and UndefinedBehaviorSanitizer with
-# the library checking its own invariants after every change.
+# the library checking its own invariants after every change. Warnings are
+# errors here. The optimised run also builds consumers against an installed
+# copy and compares the ABI with the recorded one.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/setup.sh
@@ -10,9 +12,9 @@ run() {
   local dir=$1
   shift
   echo "== $dir"
-  cmake -S . -B "$dir" "$@" >/dev/null
+  cmake -S . -B "$dir" -DCOFFER_WERROR=ON "$@" >/dev/null
   cmake --build "$dir" -j"$jobs" >/dev/null
   ctest --test-dir "$dir" --output-on-failure -j"$jobs"
 }
-run build-release -DCMAKE_BUILD_TYPE=Release
+run build-release -DCMAKE_BUILD_TYPE=Release -DCOFFER_PACKAGING_TESTS=ON
 run build-sanitize -DCMAKE_BUILD_TYPE=Debug -DCOFFER_SANITIZE=ON -DCOFFER_CHECKS=ON

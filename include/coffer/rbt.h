@@ -20,9 +20,11 @@
  * no operation moves a key or value from one node to another, so a walk may
  * remove the node it stands on once it has taken the next one.
  *
- * Reading a node: node->val is the value; the key of an RBT_* node is the
- * string at (const char *)tree->mp.base + node->key, of an RbtInt32_* node
- * (int32_t)node->key, of an RbtVoidPtr_* node (const void *)(uintptr_t)node->key.
+ * Reading a node: node->val is the value. The key of an RBT_* node is the
+ * string at (const char *)((uintptr_t)tree->mp.base + node->key) (an offset
+ * from the pool's base, added as an integer: the base may be 0), of an
+ * RbtInt32_* node (int32_t)node->key, of an RbtVoidPtr_* node
+ * (const void *)(uintptr_t)node->key.
  * The trees take no lock: serialise the calls on one tree, and on all trees
  * that share a sentinel (removal writes the sentinel's parent field).
  */
