@@ -4,7 +4,7 @@
 #include <stdio.h>
 
 int main(void) {
-  static TandelExclLock lock; /* all zero: a usable default lock */
+  static TandelExclLock lock; /* all zero: a default, in-process mutex */
   static char region[4096];
   MemPool pool;
   int32_t at = -1;
