@@ -1,10 +1,20 @@
-// Benchmarks of the containers against the standard library's nearest
-// equivalents, on the same keys and in the same order. A program, not a test:
-// it prints nanoseconds per operation and judges nothing.
+// Benchmarks the containers against the standard library's nearest
+// equivalents. A program, not a test: it prints times and ratios and judges
+// nothing.
 //
-//   build/bench/bench_containers [n]      (default n = 200000)
+//   build/bench/bench_containers
+//
+// Every pair runs in this one process on the same keys, generated from fixed
+// seeds. Each repetition runs both contenders through the same phases, in an
+// order that alternates from one repetition to the next, so that a slow
+// moment of a shared machine hits both alike; a phase's time is the median
+// of the repetitions. Small sizes repeat their cycle (build, query, empty)
+// until a phase has seen enough operations to be timed. The ratio is
+// coffer's time over the standard container's: below 1, coffer is faster.
 #include <coffer/coffer.h>
+#include <malloc.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
@@ -18,181 +28,407 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-double NsPerOp(Clock::time_point t0, size_t ops) {
-  return std::chrono::duration<double, std::nano>(Clock::now() - t0).count() / ops;
-}
-
-// The first round only warms the allocator and the caches, so that neither
-// side pays for fresh pages the other then reuses; the second is printed.
-bool g_print = false;
-
-void Row(const char *what, double coffer, double other, const char *otherName) {
-  if (!g_print) return;
-  std::printf("%-34s %9.1f ns   %-28s %9.1f ns   x%.2f\n", what, coffer, otherName, other,
-              other / coffer);
-}
-
-// Keys with long shared prefixes, as paths and identifiers have.
-std::vector<std::string> MakeKeys(size_t n, unsigned seed) {
-  std::mt19937 rng(seed);
-  std::vector<std::string> keys;
-  keys.reserve(n);
-  for (size_t i = 0; i < n; i++)
-    keys.push_back("/srv/app/config/section" + std::to_string(rng() % 64) + "/key" +
-                   std::to_string(rng()));
-  return keys;
-}
+constexpr int kReps = 5;               // counted repetitions per pair
+constexpr size_t kMinOps = 200000;     // operations per phase and repetition, at least
+constexpr size_t kMaxProbes = 200000;  // lookups and removals per cycle, at most
+constexpr int kMaxPhases = 5;
 
 volatile uintptr_t g_sink;
 
-void BenchStringTree(const std::vector<std::string> &keys) {
-  size_t n = keys.size();
-  RbtTree *t = RBT_AllocTree();
-  auto t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) RBT_Insert(t, keys[i].c_str(), i);
-  double ins = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) g_sink = RBT_Find(t, keys[i].c_str())->val;
-  double find = NsPerOp(t0, n);
-  t0 = Clock::now();
-  RBT_FreeTree(t);
-  double del = NsPerOp(t0, n);
-
-  std::multimap<std::string, uintptr_t> m;
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) m.emplace(keys[i], i);
-  double mins = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) g_sink = m.find(keys[i])->second;
-  double mfind = NsPerOp(t0, n);
-  t0 = Clock::now();
-  m.clear();
-  double mdel = NsPerOp(t0, n);
-  Row("RBT insert", ins, mins, "multimap<string> emplace");
-  Row("RBT find", find, mfind, "multimap<string> find");
-  Row("RBT free (removes one by one)", del, mdel, "multimap<string> clear");
+double Nanos(Clock::time_point t0) {
+  return std::chrono::duration<double, std::nano>(Clock::now() - t0).count();
 }
 
-void BenchIntTree(size_t n) {
-  std::mt19937 rng(7);
-  std::vector<int32_t> keys(n);
-  for (auto &k : keys) k = static_cast<int32_t>(rng() % 1000000000);
-  RbtTree *t = RbtInt32_AllocTree();
+// Times a phase and adds it to the cycle's running total.
+template <class F>
+void Timed(double *total, F &&f) {
   auto t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) RbtInt32_Insert(t, keys[i], i);
-  double ins = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) g_sink = RbtInt32_LowerBound(t, keys[i])->val;
-  double find = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) RbtInt32_Remove(t, RbtInt32_Find(t, keys[i]));
-  double del = NsPerOp(t0, n);
-  RbtInt32_FreeTree(t);
-
-  std::multimap<int32_t, uintptr_t> m;
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) m.emplace(keys[i], i);
-  double mins = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) g_sink = m.lower_bound(keys[i])->second;
-  double mfind = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) m.erase(m.find(keys[i]));
-  double mdel = NsPerOp(t0, n);
-  Row("RbtInt32 insert", ins, mins, "multimap<int> emplace");
-  Row("RbtInt32 lower bound", find, mfind, "multimap<int> lower_bound");
-  Row("RbtInt32 find + remove", del, mdel, "multimap<int> find + erase");
+  f();
+  *total += Nanos(t0);
 }
 
-void BenchSortedArray(const std::vector<std::string> &keys) {
-  size_t n = keys.size() / 10;  // insertion moves entries: keep it quadratic-friendly
-  EsaArray *a = ESA_AllocArray(0, 1024);
-  auto t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) ESA_Insert(a, keys[i].c_str(), i);
-  double ins = NsPerOp(t0, n);
-  int32_t at;
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) g_sink = ESA_Find(a, keys[i].c_str(), &at);
-  double find = NsPerOp(t0, n);
-  ESA_FreeArray(a);
-
-  std::map<std::string, uintptr_t> m;
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) m.emplace(keys[i], i);
-  double mins = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) g_sink = m.count(keys[i]);
-  double mfind = NsPerOp(t0, n);
-  Row("ESA insert", ins, mins, "map<string> emplace");
-  Row("ESA find", find, mfind, "map<string> count");
+double Median(std::vector<double> v) {
+  std::sort(v.begin(), v.end());
+  return v[v.size() / 2];
 }
 
-void BenchRegionHeap(size_t n) {
-  size_t size = 64u << 20;
-  std::vector<char> region(size);
+// One pair of contenders on one key set: the per-repetition totals of each
+// phase, divided by the operations it ran.
+struct Pair {
+  const char *family;
+  const char *versus;
+  size_t n;
+  std::vector<const char *> phases;
+  std::vector<std::vector<double>> coffer, other;  // [phase][repetition], ns per operation
+};
+
+std::vector<Pair> g_pairs;
+
+// Runs cycle(side, totals) for both sides, alternating which goes first, and
+// records ns per operation of each phase. A cycle builds from n keys and
+// runs probes operations in every other phase, except those listed in
+// fullPhases, which run n.
+template <class Cycle>
+void Measure(const char *family, const char *versus, size_t n, size_t probes,
+             std::vector<const char *> phases, std::vector<size_t> fullPhases, Cycle cycle) {
+  Pair p{family, versus, n, phases, {}, {}};
+  p.coffer.assign(phases.size(), {});
+  p.other.assign(phases.size(), {});
+  const size_t cycles = (kMinOps + n - 1) / n;
+  for (int rep = 0; rep < kReps; rep++) {
+    for (int k = 0; k < 2; k++) {
+      const bool coffer = (rep + k) % 2 == 0;
+      double totals[kMaxPhases] = {};
+      for (size_t c = 0; c < cycles; c++) cycle(coffer, totals);
+      for (size_t i = 0; i < phases.size(); i++) {
+        const bool full = std::count(fullPhases.begin(), fullPhases.end(), i) > 0;
+        (coffer ? p.coffer : p.other)[i].push_back(totals[i] /
+                                                   double((full ? n : probes) * cycles));
+      }
+    }
+  }
+  g_pairs.push_back(p);
+  std::fprintf(stderr, ".");
+}
+
+// ---- 32-bit integer keys ---------------------------------------------------
+
+// Even keys below 2e9 (within the serial order's half range); key + 1 is
+// then absent. probe is a sample of the keys in random order (all of them
+// up to kMaxProbes), absent that of the absent keys.
+struct IntKeys {
+  std::vector<int32_t> keys, absent, probe;
+  explicit IntKeys(size_t n) {
+    std::mt19937 rng(7);
+    for (size_t i = 0; i < n; i++) keys.push_back(static_cast<int32_t>(rng() % 1000000000u) * 2);
+    probe = keys;
+    std::shuffle(probe.begin(), probe.end(), rng);
+    probe.resize(std::min(n, kMaxProbes));
+    for (int32_t key : probe) absent.push_back(key + 1);
+    std::shuffle(absent.begin(), absent.end(), rng);
+  }
+};
+
+void IntCycleCoffer(const IntKeys &k, double *t) {
+  const size_t n = k.keys.size();
+  RbtTree *tree = RbtInt32_AllocTree();
+  Timed(&t[0], [&] {
+    for (size_t i = 0; i < n; i++) RbtInt32_Insert(tree, k.keys[i], i);
+  });
+  Timed(&t[1], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.absent)
+      s += reinterpret_cast<uintptr_t>(RbtInt32_LowerBound(tree, key));
+    g_sink = s;
+  });
+  Timed(&t[2], [&] {
+    uintptr_t s = 0;
+    for (RbtNode *x = RbtInt32_First(tree); x; x = RbtInt32_Next(tree, x)) s += x->val;
+    g_sink = s;
+  });
+  Timed(&t[3], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.probe) s += RbtInt32_Find(tree, key)->val;
+    g_sink = s;
+  });
+  Timed(&t[4], [&] {
+    for (const auto &key : k.probe) RbtInt32_Remove(tree, RbtInt32_Find(tree, key));
+  });
+  RbtInt32_FreeTree(tree);
+}
+
+void IntCycleStd(const IntKeys &k, double *t) {
+  const size_t n = k.keys.size();
+  std::multimap<int32_t, uint32_t> m;
+  Timed(&t[0], [&] {
+    for (size_t i = 0; i < n; i++) m.emplace(k.keys[i], i);
+  });
+  Timed(&t[1], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.absent) {
+      auto it = m.lower_bound(key);
+      s += it == m.end() ? 0 : reinterpret_cast<uintptr_t>(&*it);
+    }
+    g_sink = s;
+  });
+  Timed(&t[2], [&] {
+    uintptr_t s = 0;
+    for (auto it = m.begin(); it != m.end(); ++it) s += it->second;
+    g_sink = s;
+  });
+  Timed(&t[3], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.probe) s += m.find(key)->second;
+    g_sink = s;
+  });
+  Timed(&t[4], [&] {
+    for (const auto &key : k.probe) m.erase(m.find(key));
+  });
+}
+
+// ---- string keys -------------------------------------------------------------
+
+// Keys with long shared prefixes, as paths and identifiers have; key + "+"
+// is absent. probe and absent are samples as for the integer keys.
+struct StringKeys {
+  std::vector<std::string> keys, absent, probe;
+  explicit StringKeys(size_t n) {
+    std::mt19937 rng(1);
+    for (size_t i = 0; i < n; i++) {
+      std::string section = std::to_string(rng() % 64);
+      keys.push_back("/srv/app/config/section" + section + "/key" + std::to_string(rng()));
+    }
+    probe = keys;
+    std::shuffle(probe.begin(), probe.end(), rng);
+    probe.resize(std::min(n, kMaxProbes));
+    for (const std::string &key : probe) absent.push_back(key + "+");
+    std::shuffle(absent.begin(), absent.end(), rng);
+  }
+};
+
+void StringCycleCoffer(const StringKeys &k, double *t) {
+  const size_t n = k.keys.size();
+  RbtTree *tree = RBT_AllocTree();
+  Timed(&t[0], [&] {
+    for (size_t i = 0; i < n; i++) RBT_Insert(tree, k.keys[i].c_str(), i);
+  });
+  Timed(&t[1], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.probe) s += RBT_Find(tree, key.c_str())->val;
+    g_sink = s;
+  });
+  Timed(&t[2], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.absent)
+      s += reinterpret_cast<uintptr_t>(RBT_LowerBound(tree, key.c_str()));
+    g_sink = s;
+  });
+  Timed(&t[3], [&] {
+    for (const auto &key : k.probe) RBT_Remove(tree, RBT_Find(tree, key.c_str()));
+  });
+  RBT_FreeTree(tree);
+}
+
+void StringCycleStd(const StringKeys &k, double *t) {
+  const size_t n = k.keys.size();
+  std::multimap<std::string, uint32_t> m;
+  Timed(&t[0], [&] {
+    for (size_t i = 0; i < n; i++) m.emplace(k.keys[i], i);
+  });
+  Timed(&t[1], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.probe) s += m.find(key)->second;
+    g_sink = s;
+  });
+  Timed(&t[2], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.absent) {
+      auto it = m.lower_bound(key);
+      s += it == m.end() ? 0 : reinterpret_cast<uintptr_t>(&*it);
+    }
+    g_sink = s;
+  });
+  Timed(&t[3], [&] {
+    for (const auto &key : k.probe) m.erase(m.find(key));
+  });
+}
+
+// ---- paths -------------------------------------------------------------------
+
+// Paths of 3 to 5 names; each name is a word and a number, with more choices
+// deeper down, so upper levels are shared and lower ones fan out. probe is a
+// permutation of the paths for the lookups.
+struct PathKeys {
+  std::vector<std::string> paths, probe;
+  explicit PathKeys(size_t n) {
+    static const char *const kWords[] = {"usr", "etc",   "var",    "opt",  "srv",   "home",
+                                         "lib", "share", "config", "data", "cache", "log"};
+    static const unsigned kFanout[] = {4, 16, 64, 256, 1024};
+    std::mt19937 rng(3);
+    for (size_t i = 0; i < n; i++) {
+      std::string p;
+      const unsigned depth = 3 + rng() % 3;
+      for (unsigned level = 0; level < depth; level++)
+        p += std::string("/") + kWords[rng() % 12] + std::to_string(rng() % kFanout[level]);
+      paths.push_back(p);
+    }
+    probe = paths;
+    std::shuffle(probe.begin(), probe.end(), rng);
+  }
+};
+
+void PathCycleCoffer(const PathKeys &k, double *t) {
+  const size_t n = k.paths.size();
+  HstTree *tree = HST_AllocTree('/', 0, 4, 8);
+  Timed(&t[0], [&] {
+    for (size_t i = 0; i < n; i++) HST_Insert(tree, k.paths[i].c_str(), i);
+  });
+  Timed(&t[1], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.probe) s += HST_GetVal(tree, HST_Find(tree, key.c_str()));
+    g_sink = s;
+  });
+  HST_FreeTree(tree);
+}
+
+void PathCycleStd(const PathKeys &k, double *t) {
+  const size_t n = k.paths.size();
+  std::map<std::string, uint32_t> m;
+  Timed(&t[0], [&] {
+    for (size_t i = 0; i < n; i++) m[k.paths[i]] = i;
+  });
+  Timed(&t[1], [&] {
+    uintptr_t s = 0;
+    for (const auto &key : k.probe) s += m.find(key)->second;
+    g_sink = s;
+  });
+}
+
+// ---- sorted array and region heap, for reference -----------------------------
+
+// The array is filled in key order, so that building it moves no entry.
+void ArrayCycle(bool coffer, const StringKeys &k, double *t) {
+  const size_t n = k.keys.size();
+  if (coffer) {
+    std::vector<std::string> sorted = k.keys;
+    std::sort(sorted.begin(), sorted.end());
+    EsaArray *a = ESA_AllocArray(0, 1024);
+    for (size_t i = 0; i < n; i++) ESA_Insert(a, sorted[i].c_str(), i);
+    Timed(&t[0], [&] {
+      int32_t at, s = 0;
+      for (const auto &key : k.probe) s += ESA_Find(a, key.c_str(), &at);
+      g_sink = s;
+    });
+    ESA_FreeArray(a);
+  } else {
+    std::map<std::string, uint32_t> m;
+    for (size_t i = 0; i < n; i++) m.emplace(k.keys[i], i);
+    Timed(&t[0], [&] {
+      size_t s = 0;
+      for (const auto &key : k.probe) s += m.count(key);
+      g_sink = s;
+    });
+  }
+}
+
+void HeapCycle(bool coffer, size_t n, double *t) {
+  static std::vector<char> region(64u << 20);
   MemPool pool;
-  MemPool_InitOnSimpleHeap(&pool, region.data(), size);
+  MemPool_InitOnSimpleHeap(&pool, region.data(), region.size());
   std::mt19937 rng(11);
-  std::vector<size_t> sizes(n);
-  for (auto &s : sizes) s = 8 + rng() % 120;
+  std::vector<size_t> sizes(n), slots(n);
+  for (size_t i = 0; i < n; i++) sizes[i] = 8 + rng() % 120, slots[i] = rng() % 1024;
   std::vector<void *> live(1024, nullptr);
-  auto t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) {
-    void *&slot = live[rng() % live.size()];
-    pool.free(&pool, slot);
-    slot = pool.alloc(&pool, sizes[i]);
-  }
-  double sh = NsPerOp(t0, n);
-  for (void *&p : live) pool.free(&pool, p), p = nullptr;
-  rng.seed(11);
-  for (auto &s : sizes) s = 8 + rng() % 120;
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) {
-    void *&slot = live[rng() % live.size()];
-    std::free(slot);
-    slot = std::malloc(sizes[i]);
-  }
-  double libc = NsPerOp(t0, n);
-  for (void *p : live) std::free(p);
-  Row("region heap free + alloc", sh, libc, "libc free + malloc");
+  Timed(&t[0], [&] {
+    for (size_t i = 0; i < n; i++) {
+      void *&slot = live[slots[i]];
+      if (coffer) {
+        pool.free(&pool, slot);
+        slot = pool.alloc(&pool, sizes[i]);
+      } else {
+        std::free(slot);
+        slot = std::malloc(sizes[i]);
+      }
+    }
+  });
+  for (void *p : live) coffer ? pool.free(&pool, p) : std::free(p);
 }
 
-void BenchStringTreePaths(const std::vector<std::string> &keys) {
-  size_t n = keys.size() / 4;
-  HstTree *t = HST_AllocTree('/', 0, 4, 8);
-  auto t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) HST_Insert(t, keys[i].c_str(), i);
-  double ins = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) g_sink = HST_GetVal(t, HST_Find(t, keys[i].c_str()));
-  double find = NsPerOp(t0, n);
-  HST_FreeTree(t);
+// ---- report --------------------------------------------------------------------
 
-  std::map<std::string, uintptr_t> m;
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) m[keys[i]] = i;
-  double mins = NsPerOp(t0, n);
-  t0 = Clock::now();
-  for (size_t i = 0; i < n; i++) g_sink = m.find(keys[i])->second;
-  double mfind = NsPerOp(t0, n);
-  Row("HST insert at path", ins, mins, "map<full path> assign");
-  Row("HST find path", find, mfind, "map<full path> find");
+void PrintDetails() {
+  std::printf("\n%-10s %-9s %-22s %12s %12s %7s\n", "family", "n", "phase", "coffer ns", "std ns",
+              "ratio");
+  for (const Pair &p : g_pairs)
+    for (size_t i = 0; i < p.phases.size(); i++) {
+      if (i == 0) std::printf("-- %s vs %s, %zu keys\n", p.family, p.versus, p.n);
+      const double a = Median(p.coffer[i]), b = Median(p.other[i]);
+      std::printf("%-10s %-9zu %-22s %12.1f %12.1f %7.2f\n", p.family, p.n, p.phases[i], a, b,
+                  a / b);
+    }
+}
+
+double Ratio(const char *family, size_t n, const char *phase) {
+  for (const Pair &p : g_pairs)
+    if (std::strcmp(p.family, family) == 0 && p.n == n)
+      for (size_t i = 0; i < p.phases.size(); i++)
+        if (std::strcmp(p.phases[i], phase) == 0) return Median(p.coffer[i]) / Median(p.other[i]);
+  return 0;
+}
+
+// The summary in the layout of the project's measurement table.
+void PrintSummary(const size_t *intSizes, const size_t *pathSizes) {
+  std::printf("\nratio = coffer's time / the standard container's (below 1 coffer is faster)\n\n");
+  std::printf("| operation | %zu keys | %zu keys | %zu keys |\n|---|---|---|---|\n", intSizes[0],
+              intSizes[1], intSizes[2]);
+  struct {
+    const char *label, *phase;
+  } const intRows[] = {
+      {"`RbtInt32_Insert` vs `std::multimap<int32_t,uint32_t>`", "insert"},
+      {"`RbtInt32_LowerBound` (absent keys)", "lower bound (absent)"},
+      {"in-order walk with `RbtInt32_Next`", "walk with Next"},
+      {"`RbtInt32_Find` + `RbtInt32_Remove`", "find + remove"},
+      {"`RbtInt32_Find`", "find"},
+  };
+  for (const auto &r : intRows)
+    std::printf("| %s | %.2f | %.2f | %.2f |\n", r.label, Ratio("RbtInt32", intSizes[0], r.phase),
+                Ratio("RbtInt32", intSizes[1], r.phase), Ratio("RbtInt32", intSizes[2], r.phase));
+  std::printf(
+      "| `RBT_*` string keys, insert / find / lower bound / find + remove vs "
+      "`std::multimap<std::string,uint32_t>` |");
+  for (int s = 0; s < 3; s++)
+    std::printf(" %.2f / %.2f / %.2f / %.2f |", Ratio("RBT", intSizes[s], "insert"),
+                Ratio("RBT", intSizes[s], "find"),
+                Ratio("RBT", intSizes[s], "lower bound (absent)"),
+                Ratio("RBT", intSizes[s], "find + remove"));
+  std::printf(
+      "\n| `HST_Find` vs a `std::map` of full paths (depth 3 to 5) | %.2f (%zu) | %.2f (%zu) | |\n",
+      Ratio("HST", pathSizes[0], "find"), pathSizes[0], Ratio("HST", pathSizes[1], "find"),
+      pathSizes[1]);
+  std::printf("| `HST_Insert` vs the same map | %.2f (%zu) | %.2f (%zu) | |\n",
+              Ratio("HST", pathSizes[0], "insert"), pathSizes[0],
+              Ratio("HST", pathSizes[1], "insert"), pathSizes[1]);
 }
 
 }  // namespace
 
-int main(int argc, char **argv) {
-  size_t n = argc > 1 ? std::strtoul(argv[1], nullptr, 10) : 200000;
-  std::vector<std::string> keys = MakeKeys(n, 1);
-  std::printf("n = %zu\n%-34s %12s   %-28s %12s   %s\n", n, "coffer", "", "alternative", "",
-              "alternative / coffer");
-  for (int round = 0; round < 2; round++) {
-    g_print = round == 1;
-    BenchStringTree(keys);
-    BenchIntTree(n);
-    BenchSortedArray(keys);
-    BenchStringTreePaths(keys);
-    BenchRegionHeap(n * 5);
+int main() {
+  // Keep freed memory in the process, so that no repetition pays the kernel
+  // for pages an earlier one gave back.
+  mallopt(M_TRIM_THRESHOLD, 1 << 30);
+  mallopt(M_MMAP_THRESHOLD, 1 << 30);
+
+  const size_t intSizes[] = {1000, 100000, 1000000};
+  const size_t pathSizes[] = {10000, 100000};
+  std::fprintf(stderr, "measuring");
+  for (size_t n : intSizes) {
+    IntKeys k(n);
+    Measure("RbtInt32", "std::multimap<int32_t,uint32_t>", n, k.probe.size(),
+            {"insert", "lower bound (absent)", "walk with Next", "find", "find + remove"}, {0, 2},
+            [&](bool coffer, double *t) { coffer ? IntCycleCoffer(k, t) : IntCycleStd(k, t); });
   }
+  for (size_t n : intSizes) {
+    StringKeys k(n);
+    Measure(
+        "RBT", "std::multimap<std::string,uint32_t>", n, k.probe.size(),
+        {"insert", "find", "lower bound (absent)", "find + remove"}, {0},
+        [&](bool coffer, double *t) { coffer ? StringCycleCoffer(k, t) : StringCycleStd(k, t); });
+  }
+  for (size_t n : pathSizes) {
+    PathKeys k(n);
+    Measure("HST", "std::map<std::string,uint32_t> of full paths", n, k.probe.size(),
+            {"insert", "find"}, {0},
+            [&](bool coffer, double *t) { coffer ? PathCycleCoffer(k, t) : PathCycleStd(k, t); });
+  }
+  {
+    StringKeys k(20000);
+    Measure("ESA", "std::map<std::string,uint32_t>", 20000, k.probe.size(), {"find"}, {},
+            [&](bool coffer, double *t) { ArrayCycle(coffer, k, t); });
+  }
+  Measure("SH", "libc", 1000000, 1000000, {"free + alloc"}, {},
+          [&](bool coffer, double *t) { HeapCycle(coffer, 1000000, t); });
+  std::fprintf(stderr, "\n");
+  PrintDetails();
+  PrintSummary(intSizes, pathSizes);
   return 0;
 }
