@@ -2,7 +2,10 @@
 // equivalents. A program, not a test: it prints times and ratios and judges
 // nothing.
 //
-//   build/bench/bench_containers
+//   build/bench/bench_containers [family...]
+//
+// With arguments, only the families named (RbtInt32, RBT, HST, ESA, SH) are
+// measured, and the summary leaves the others empty.
 //
 // Every pair runs in this one process on the same keys, generated from fixed
 // seeds. Each repetition runs both contenders through the same phases, in an
@@ -392,7 +395,7 @@ void PrintSummary(const size_t *intSizes, const size_t *pathSizes) {
 
 }  // namespace
 
-int main() {
+int main(int argc, char **argv) {
   // Keep freed memory in the process, so that no repetition pays the kernel
   // for pages an earlier one gave back.
   mallopt(M_TRIM_THRESHOLD, 1 << 30);
@@ -400,14 +403,22 @@ int main() {
 
   const size_t intSizes[] = {1000, 100000, 1000000};
   const size_t pathSizes[] = {10000, 100000};
+  auto wanted = [&](const char *family) {
+    if (argc < 2) return true;
+    for (int i = 1; i < argc; i++)
+      if (std::strcmp(argv[i], family) == 0) return true;
+    return false;
+  };
   std::fprintf(stderr, "measuring");
   for (size_t n : intSizes) {
+    if (!wanted("RbtInt32")) break;
     IntKeys k(n);
     Measure("RbtInt32", "std::multimap<int32_t,uint32_t>", n, k.probe.size(),
             {"insert", "lower bound (absent)", "walk with Next", "find", "find + remove"}, {0, 2},
             [&](bool coffer, double *t) { coffer ? IntCycleCoffer(k, t) : IntCycleStd(k, t); });
   }
   for (size_t n : intSizes) {
+    if (!wanted("RBT")) break;
     StringKeys k(n);
     Measure(
         "RBT", "std::multimap<std::string,uint32_t>", n, k.probe.size(),
@@ -415,18 +426,20 @@ int main() {
         [&](bool coffer, double *t) { coffer ? StringCycleCoffer(k, t) : StringCycleStd(k, t); });
   }
   for (size_t n : pathSizes) {
+    if (!wanted("HST")) break;
     PathKeys k(n);
     Measure("HST", "std::map<std::string,uint32_t> of full paths", n, k.probe.size(),
             {"insert", "find"}, {0},
             [&](bool coffer, double *t) { coffer ? PathCycleCoffer(k, t) : PathCycleStd(k, t); });
   }
-  {
+  if (wanted("ESA")) {
     StringKeys k(20000);
     Measure("ESA", "std::map<std::string,uint32_t>", 20000, k.probe.size(), {"find"}, {},
             [&](bool coffer, double *t) { ArrayCycle(coffer, k, t); });
   }
-  Measure("SH", "libc", 1000000, 1000000, {"free + alloc"}, {},
-          [&](bool coffer, double *t) { HeapCycle(coffer, 1000000, t); });
+  if (wanted("SH"))
+    Measure("SH", "libc", 1000000, 1000000, {"free + alloc"}, {},
+            [&](bool coffer, double *t) { HeapCycle(coffer, 1000000, t); });
   std::fprintf(stderr, "\n");
   PrintDetails();
   PrintSummary(intSizes, pathSizes);
