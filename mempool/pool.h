@@ -13,13 +13,20 @@ namespace coffer {
 // The only place where a PoolOffset turns into an address and back. 0 is null
 // both ways; nothing a pool hands out sits at its own base.
 // The sums wrap in 32 bits, so they are formed on integers, not pointers.
+// The linked forms skip the test for 0 and null: they serve offsets that are
+// never 0 and addresses that are never null (see LinkedRecordAt below).
+inline void *LinkedAddr(const MemPool *mp, PoolOffset off) {
+  return reinterpret_cast<void *>(reinterpret_cast<uintptr_t>(mp->base) + off);
+}
+inline PoolOffset LinkedOffset(const MemPool *mp, const void *p) {
+  return static_cast<PoolOffset>(reinterpret_cast<uintptr_t>(p) -
+                                 reinterpret_cast<uintptr_t>(mp->base));
+}
 inline void *OffsetToAddr(const MemPool *mp, PoolOffset off) {
-  return off ? reinterpret_cast<void *>(reinterpret_cast<uintptr_t>(mp->base) + off) : nullptr;
+  return off ? LinkedAddr(mp, off) : nullptr;
 }
 inline PoolOffset AddrToOffset(const MemPool *mp, const void *p) {
-  return p ? static_cast<PoolOffset>(reinterpret_cast<uintptr_t>(p) -
-                                     reinterpret_cast<uintptr_t>(mp->base))
-           : 0;
+  return p ? LinkedOffset(mp, p) : 0;
 }
 
 // count x size for a pool's calloc; false when the product does not fit in
@@ -43,6 +50,18 @@ inline T *RecordAt(const CollectionHeader *h, PoolOffset off) {
 }
 inline PoolOffset OffsetOf(const CollectionHeader *h, const void *p) {
   return AddrToOffset(&h->mp, p);
+}
+
+// The same idiom for offsets that are never 0 and records that are never
+// null: the links inside a tree, where an absent node is the tree's sentinel,
+// and the entries of a child array. They skip the null test, which would
+// otherwise cost a branch at every step of every descent.
+template <class T>
+inline T *LinkedRecordAt(const CollectionHeader *h, PoolOffset off) {
+  return static_cast<T *>(LinkedAddr(&h->mp, off));
+}
+inline PoolOffset LinkedOffsetOf(const CollectionHeader *h, const void *p) {
+  return LinkedOffset(&h->mp, p);
 }
 
 // Every allocation of a container goes through its handle's pool copy, with

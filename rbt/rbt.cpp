@@ -33,14 +33,18 @@ struct StringKey {
         : tree(t), key(reinterpret_cast<const signed char *>(k)) {}
 
     int Compare(const RbtNode *x) {
-      const signed char *other = RecordAt<const signed char>(tree, x->key);
+      // A key copy is never at offset 0.
+      const signed char *other = LinkedRecordAt<const signed char>(tree, x->key);
       uint32_t i = lcpLow < lcpHigh ? lcpLow : lcpHigh;
       while (key[i] == other[i] && key[i] != 0) ++i;
       stop = i;
       return key[i] - other[i];
     }
-    void WentLeft() { lcpHigh = stop; }
-    void WentRight() { lcpLow = stop; }
+    void Went(bool left) {
+      // Selections rather than a branch on the direction (see ChildLink).
+      lcpHigh = left ? stop : lcpHigh;
+      lcpLow = left ? lcpLow : stop;
+    }
   };
 };
 

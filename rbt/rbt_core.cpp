@@ -41,54 +41,6 @@ namespace coffer {
 
 namespace {
 
-// Each walk and balancing case has a mirror image; both are written once, for
-// the side L (true: left), with the near child on that side and the far one
-// opposite.
-template <bool L, class Node>
-inline auto &Near(Node *n) {
-  return L ? n->left : n->right;
-}
-template <bool L, class Node>
-inline auto &Far(Node *n) {
-  return L ? n->right : n->left;
-}
-
-// The last node on side L below xo (the leftmost for L true); the sentinel
-// for an empty subtree.
-template <bool L>
-RbtNode *Extreme(const RbtCtx &c, PoolOffset xo) {
-  if (xo == c.nilOff) return c.nil;
-  RbtNode *x = c.NodeAt(xo);
-  while (Near<L>(x) != c.nilOff) x = c.NodeAt(Near<L>(x));
-  return x;
-}
-
-// x's in-order neighbour on its far side (the successor for L true): the
-// nearest node of the far subtree, else the first ancestor reached from its
-// near side. The sentinel past the end.
-template <bool L>
-RbtNode *Neighbour(const RbtCtx &c, const RbtNode *x) {
-  if (Far<L>(x) != c.nilOff) return Extreme<L>(c, Far<L>(x));
-  // Climb while coming from the far side; compare offsets, not addresses.
-  PoolOffset xo = c.OffsetOf(x);
-  for (PoolOffset yo = x->parent; yo != c.nilOff;) {
-    RbtNode *y = c.NodeAt(yo);
-    if (Far<L>(y) != xo) return y;
-    xo = yo;
-    yo = y->parent;
-  }
-  return c.nil;
-}
-
-}  // namespace
-
-RbtNode *RBTSuccessor(const RbtCtx &c, const RbtNode *x) { return Neighbour<true>(c, x); }
-RbtNode *RBTPredecessor(const RbtCtx &c, const RbtNode *x) { return Neighbour<false>(c, x); }
-RbtNode *RBTMinimum(const RbtCtx &c) { return Extreme<true>(c, c.d->root); }
-RbtNode *RBTMaximum(const RbtCtx &c) { return Extreme<false>(c, c.d->root); }
-
-namespace {
-
 // Points whatever linked to old (its parent's child link, or root) at repl.
 inline void ReplaceChild(const RbtCtx &c, PoolOffset parent, PoolOffset old, PoolOffset repl) {
   if (parent == c.nilOff) {

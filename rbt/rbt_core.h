@@ -10,9 +10,9 @@
 //   struct Probe                   one descent's comparator: Probe(tree, key),
 //                                  Compare(node) < 0, 0, > 0 as the key comes
 //                                  before, equals or follows the node's key,
-//                                  WentLeft()/WentRight() after each step (the
-//                                  string family keeps its common prefixes
-//                                  there)
+//                                  Went(left) after each step, true when the
+//                                  descent goes left (the string family keeps
+//                                  its common prefixes there)
 //
 // Every instance is a hidden function of its family; the exported calls are
 // thin wrappers around them (COFFER_RBT_DEFINE_FAMILY below).
@@ -51,13 +51,8 @@ RbtNode *InsertNode(RbtTree *tree, RbtNode *node, typename K::Arg key, CofferVal
   for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
     y = c.NodeAt(xo);
     left = probe.Compare(y) < 0;
-    if (left) {
-      probe.WentLeft();
-      xo = y->left;
-    } else {
-      probe.WentRight();
-      xo = y->right;
-    }
+    probe.Went(left);
+    xo = ChildLink(y, !left);
   }
   // The last comparison was against y, so it also says on which side of y
   // the node goes.
@@ -82,7 +77,7 @@ void RemoveRange(RbtTree *tree, RbtNode *first, RbtNode *end) {
   if (first == end) return;
   RbtCtx c(tree);
   for (;;) {
-    RbtNode *next = c.OrNull(RBTSuccessor(c, first));
+    RbtNode *next = RBTSuccessor(c, first);
     RemoveNode<K>(c, first);
     if (next == end) return;
     first = next;
@@ -93,11 +88,9 @@ template <class K>
 void Clear(RbtTree *tree) {
   RbtCtx c(tree);
   if (c.d->size == 0) return;
-  RbtNode *x = RBTMinimum(c);
-  for (;;) {
+  for (RbtNode *x = RBTMinimum(c); x;) {
     RbtNode *next = RBTSuccessor(c, x);
     RemoveNode<K>(c, x);
-    if (next == c.nil) return;
     x = next;
   }
 }
@@ -124,13 +117,8 @@ RbtNode *Find(RbtTree *tree, typename K::Arg key) {
     RbtNode *x = c.NodeAt(xo);
     int r = probe.Compare(x);
     if (r == 0) return x;
-    if (r < 0) {
-      probe.WentLeft();
-      xo = x->left;
-    } else {
-      probe.WentRight();
-      xo = x->right;
-    }
+    probe.Went(r < 0);
+    xo = ChildLink(x, r > 0);
   }
   return nullptr;
 }
@@ -139,7 +127,8 @@ RbtNode *Find(RbtTree *tree, typename K::Arg key) {
 // left: going left on equality too finds the first of an equal run, going
 // right on it finds the first node past the run, without walking the run.
 // The common-prefix bounds stay valid, since an equal key bounds the subtree
-// it leads into like any other.
+// it leads into like any other. The step is written as selections, which
+// the compiler can make without branches.
 template <class K, bool kPastEqual>
 RbtNode *Bound(RbtTree *tree, typename K::Arg key) {
   RbtCtx c(tree);
@@ -148,14 +137,10 @@ RbtNode *Bound(RbtTree *tree, typename K::Arg key) {
   for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
     RbtNode *x = c.NodeAt(xo);
     int r = probe.Compare(x);
-    if (kPastEqual ? r < 0 : r <= 0) {
-      bound = x;
-      probe.WentLeft();
-      xo = x->left;
-    } else {
-      probe.WentRight();
-      xo = x->right;
-    }
+    const bool left = kPastEqual ? r < 0 : r <= 0;
+    bound = left ? x : bound;
+    probe.Went(left);
+    xo = ChildLink(x, !left);
   }
   return bound;
 }
@@ -177,13 +162,10 @@ inline RbtNode *First(RbtTree *tree) {
   RbtCtx c(tree);
   return c.d->size ? RBTMinimum(c) : nullptr;
 }
-inline RbtNode *Next(RbtTree *tree, RbtNode *node) {
-  RbtCtx c(tree);
-  return c.OrNull(RBTSuccessor(c, node));
-}
+inline RbtNode *Next(RbtTree *tree, RbtNode *node) { return RBTSuccessor(RbtCtx(tree), node); }
 inline RbtNode *Prev(RbtTree *tree, RbtNode *node) {
   RbtCtx c(tree);
-  return c.OrNull(node ? RBTPredecessor(c, node) : RBTMaximum(c));
+  return node ? RBTPredecessor(c, node) : RBTMaximum(c);
 }
 inline int32_t GetSize(RbtTree *tree) {
   return static_cast<int32_t>(static_cast<RbtTreeData *>(tree->data)->size);

@@ -17,32 +17,88 @@ namespace coffer {
 enum : uint8_t { kRbtBlack = 0, kRbtRed = 1 };
 
 // One call's view of a tree: the data record and the sentinel, resolved once.
-// Links inside the tree are never 0 (an absent child is the sentinel), and
-// loops test them against nilOff before converting, so a walk converts only
-// the nodes it actually visits.
+// Links inside the tree are never 0 (an absent child is the sentinel), so
+// they convert without a null test, and loops test them against nilOff
+// before converting, so a walk converts only the nodes it actually visits.
 struct RbtCtx {
   RbtTree *t;
   RbtTreeData *d;
-  RbtNode *nil;
   PoolOffset nilOff;
+  RbtNode *nil;
 
   explicit RbtCtx(RbtTree *tree)
-      : t(tree), d(static_cast<RbtTreeData *>(tree->data)), nil(RecordAt<RbtNode>(tree, d->nil)),
-        nilOff(d->nil) {}
+      : t(tree), d(static_cast<RbtTreeData *>(tree->data)), nilOff(d->nil), nil(NodeAt(nilOff)) {}
 
   // The tree's one place where offsets and nodes meet.
-  RbtNode *NodeAt(PoolOffset off) const { return RecordAt<RbtNode>(t, off); }
-  PoolOffset OffsetOf(const RbtNode *n) const { return coffer::OffsetOf(t, n); }
-  // Null for the sentinel: what the public calls hand back.
-  RbtNode *OrNull(RbtNode *n) const { return n == nil ? nullptr : n; }
+  RbtNode *NodeAt(PoolOffset off) const { return LinkedRecordAt<RbtNode>(t, off); }
+  PoolOffset OffsetOf(const RbtNode *n) const { return LinkedOffsetOf(t, n); }
 };
 
-// Neighbour walks; both return the sentinel past either end.
-RbtNode *RBTSuccessor(const RbtCtx &c, const RbtNode *x);
-RbtNode *RBTPredecessor(const RbtCtx &c, const RbtNode *x);
-// Leftmost and rightmost nodes; the sentinel for an empty tree.
-RbtNode *RBTMinimum(const RbtCtx &c);
-RbtNode *RBTMaximum(const RbtCtx &c);
+// Each walk and balancing case has a mirror image; both are written once, for
+// the side L (true: left), with the near child on that side and the far one
+// opposite.
+template <bool L, class Node>
+inline auto &Near(Node *n) {
+  return L ? n->left : n->right;
+}
+template <bool L, class Node>
+inline auto &Far(Node *n) {
+  return L ? n->right : n->left;
+}
+
+// The child link on the side a comparison chose (right: true for the right
+// child). A descent's direction is a coin toss that the processor would
+// mispredict at every other step, so the child is picked with a conditional
+// move, not a branch. The empty asm statement hides the picked link from the
+// optimiser, which would otherwise merge the choice with the search's own
+// tests of the comparison and branch on it again; it emits no instruction.
+inline PoolOffset ChildLink(const RbtNode *x, bool right) {
+  PoolOffset link = right ? x->right : x->left;
+  asm("" : "+r"(link));
+  return link;
+}
+
+// The walks below are inline: they are most of the work of the public
+// neighbour calls, which then convert and test only what they visit.
+
+// The last node on side L below xo (the leftmost for L true); xo is not the
+// sentinel.
+template <bool L>
+inline RbtNode *RBTExtreme(const RbtCtx &c, PoolOffset xo) {
+  RbtNode *x = c.NodeAt(xo);
+  for (PoolOffset next; (next = Near<L>(x)) != c.nilOff;) x = c.NodeAt(next);
+  return x;
+}
+
+// x's in-order neighbour on its far side (the successor for L true): the
+// nearest node of the far subtree, else the first ancestor reached from its
+// near side. Null past the end.
+template <bool L>
+inline RbtNode *RBTNeighbour(const RbtCtx &c, const RbtNode *x) {
+  if (Far<L>(x) != c.nilOff) return RBTExtreme<L>(c, Far<L>(x));
+  // Climb while coming from the far side; compare offsets, not addresses.
+  PoolOffset xo = c.OffsetOf(x);
+  for (PoolOffset yo = x->parent; yo != c.nilOff;) {
+    RbtNode *y = c.NodeAt(yo);
+    if (Far<L>(y) != xo) return y;
+    xo = yo;
+    yo = y->parent;
+  }
+  return nullptr;
+}
+
+// Neighbour walks; both return null past either end.
+inline RbtNode *RBTSuccessor(const RbtCtx &c, const RbtNode *x) { return RBTNeighbour<true>(c, x); }
+inline RbtNode *RBTPredecessor(const RbtCtx &c, const RbtNode *x) {
+  return RBTNeighbour<false>(c, x);
+}
+// Leftmost and rightmost nodes; null for an empty tree.
+inline RbtNode *RBTMinimum(const RbtCtx &c) {
+  return c.d->root == c.nilOff ? nullptr : RBTExtreme<true>(c, c.d->root);
+}
+inline RbtNode *RBTMaximum(const RbtCtx &c) {
+  return c.d->root == c.nilOff ? nullptr : RBTExtreme<false>(c, c.d->root);
+}
 
 // Links a filled red node z below parent (the sentinel for an empty tree) on
 // the given side, rebalances and counts it.

@@ -22,19 +22,17 @@ struct WordKey {
 
     Probe(const RbtTree *, Arg k) : key(Order::Word(k)) {}
     int Compare(const RbtNode *x) const { return Order::Compare(key, x->key); }
-    void WentLeft() {}
-    void WentRight() {}
+    void Went(bool) {}
   };
 };
 
 // a comes before b when a - b, wrapped to 32 bits, reads as negative. This
-// is the signed order while a tree's keys span less than 2^31.
+// is the signed order while a tree's keys span less than 2^31. The wrapped
+// difference is itself the comparison's result: one subtraction, whose sign
+// the descents test without a branch.
 struct SerialOrder {
   static uint32_t Word(int32_t key) { return static_cast<uint32_t>(key); }
-  static int Compare(uint32_t a, uint32_t b) {
-    if (a == b) return 0;
-    return static_cast<int32_t>(a - b) < 0 ? -1 : 1;
-  }
+  static int Compare(uint32_t a, uint32_t b) { return static_cast<int32_t>(a - b); }
 };
 
 // The address as a number; never dereferenced nor made an offset.
@@ -42,7 +40,7 @@ struct AddressOrder {
   static uint32_t Word(const void *key) {
     return static_cast<uint32_t>(reinterpret_cast<uintptr_t>(key));
   }
-  static int Compare(uint32_t a, uint32_t b) { return a < b ? -1 : a > b ? 1 : 0; }
+  static int Compare(uint32_t a, uint32_t b) { return (a > b) - (a < b); }
 };
 
 using Int32Key = WordKey<SerialOrder, int32_t>;
