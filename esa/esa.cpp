@@ -61,6 +61,24 @@ void ESAShiftEntries(EsaArray *arr, int32_t from, int32_t to, int32_t dest) {
   std::memmove(e + dest, e + from, (to - from) * sizeof(EsaEntry));
 }
 
+bool ESAInsertAt(EsaArray *arr, int32_t index, const char *key, CofferVal val) {
+  EsaArrayData *d = Data(arr);
+  if (d->size == d->capacity) {
+    int32_t step = Step(d);
+    if (d->size > INT32_MAX - step || !ESAResize(arr, d->size + step)) return false;
+  }
+  // The key copy is made before any entry moves, so a refusal leaves the
+  // entries where they were (a grown capacity stays grown).
+  char *copy = PoolStrdup(arr, key);
+  if (!copy) return false;
+  ESAShiftEntries(arr, index, d->size, index + 1);
+  EsaEntry *e = EntriesOf(arr) + index;
+  e->key = OffsetOf(arr, copy);
+  e->val = val;
+  d->size++;
+  return true;
+}
+
 }  // namespace coffer
 
 using namespace coffer;
@@ -140,10 +158,6 @@ bool ESA_SetVal(EsaArray *arr, int32_t index, CofferVal val) {
 bool ESA_Insert(EsaArray *arr, const char *key, CofferVal val) {
   COFFER_CHECK_ON_RETURN("sorted string array", ESACheckArray, arr);
   EsaArrayData *d = Data(arr);
-  if (d->size == d->capacity) {
-    int32_t step = Step(d);
-    if (d->size > INT32_MAX - step || !ESAResize(arr, d->size + step)) return false;
-  }
   // Bisect to the slot after every key <= the new one, so equal keys keep
   // their insertion order.
   EsaEntry *e = EntriesOf(arr);
@@ -155,15 +169,7 @@ bool ESA_Insert(EsaArray *arr, const char *key, CofferVal val) {
     else
       low = middle + 1;
   }
-  // The key copy is made before any entry moves, so a refusal leaves the
-  // entries where they were (a grown capacity stays grown).
-  char *copy = PoolStrdup(arr, key);
-  if (!copy) return false;
-  ESAShiftEntries(arr, low, d->size, low + 1);
-  e[low].key = OffsetOf(arr, copy);
-  e[low].val = val;
-  d->size++;
-  return true;
+  return ESAInsertAt(arr, low, key, val);
 }
 
 bool ESA_Find(EsaArray *arr, const char *key, int32_t *outIndex) {

@@ -50,7 +50,7 @@ COFFER_API bool HST_CreateTreeData(HstTree *tree, char separator, CofferVal defa
   data->defaultVal = defaultVal;
   data->childCapacity = childCapacity;
   data->childCapacityIncrement = childCapacityIncrement;
-  HstNode *root = HSTAllocNode(tree, "", defaultVal);  // size becomes 1
+  HstNode *root = AllocNode(tree, "", defaultVal);  // size becomes 1
   if (!root) {
     PoolFree(tree, data);
     tree->data = nullptr;
@@ -70,7 +70,7 @@ COFFER_API MpFreeValFn HST_SetMpFreeValFn(HstTree *tree, MpFreeValFn fn) {
   return SetMpFreeValFn(tree, fn);
 }
 
-COFFER_API HstNode *HST_GetRoot(HstTree *tree) { return NodeAt(tree, Data(tree)->root); }
+COFFER_API HstNode *HST_GetRoot(HstTree *tree) { return Root(tree); }
 
 COFFER_API HstNode *HST_GetParent(HstTree *tree, HstNode *node) {
   return NodeAt(tree, node->parent);
@@ -98,14 +98,48 @@ COFFER_API HstNode *HST_GetChild(HstTree *tree, HstNode *node, int32_t index) {
 }
 
 COFFER_API HstNode *HST_FindChild(HstTree *tree, HstNode *node, const char *key) {
-  if (!node->children) return nullptr;
-  EsaArray kids = Children(tree, node);
-  int32_t index;
-  if (!ESA_Find(&kids, key, &index)) return nullptr;
-  return NodeAt(tree, static_cast<PoolOffset>(ESA_GetVal(&kids, index)));
+  int32_t slot;
+  return FindChildIn(tree, node, key, &slot);
 }
 
 COFFER_API HstNode *HSTAllocNode(HstTree *tree, const char *key, CofferVal val) {
+  return AllocNode(tree, key, val);
+}
+
+COFFER_API bool HSTAllocChild(HstTree *tree, HstNode *node) { return AllocChildArray(tree, node); }
+
+COFFER_API HstNode *HSTInsertChildNode(HstTree *tree, HstNode *parent, HstNode *node) {
+  if (!parent->children && !AllocChildArray(tree, parent)) return nullptr;
+  EsaArray kids = Children(tree, parent);
+  if (!ESA_Insert(&kids, HST_GetKey(tree, node), OffsetOf(tree, node))) return nullptr;
+  node->parent = OffsetOf(tree, parent);
+  return node;
+}
+
+COFFER_API HstNode *HST_InsertChild(HstTree *tree, HstNode *parent, const char *key,
+                                    CofferVal val) {
+  HST_CHECKED(tree);
+  return InsertChild(tree, parent, key, val, kSlotAfterEqual);
+}
+
+COFFER_API void HSTFreeNode(HstTree *tree, HstNode *node) {
+  if (node->children) {
+    // Only the array goes: its entries' key copies, entry block and record.
+    // The child nodes they name are the caller's business.
+    EsaArray kids = Children(tree, node);
+    ESA_FreeArray(&kids);
+  }
+  PoolFree(tree, RecordAt<char>(tree, node->key));
+  PoolFree(tree, node);
+  Data(tree)->size--;
+}
+
+}  // extern "C"
+
+namespace coffer {
+namespace hst {
+
+HstNode *AllocNode(HstTree *tree, const char *key, CofferVal val) {
   if (!key) return nullptr;
   // Both allocations are always asked for, key copy first, so a pool sees
   // the same sequence of calls whichever of them it refuses.
@@ -123,7 +157,7 @@ COFFER_API HstNode *HSTAllocNode(HstTree *tree, const char *key, CofferVal val) 
   return node;
 }
 
-COFFER_API bool HSTAllocChild(HstTree *tree, HstNode *node) {
+bool AllocChildArray(HstTree *tree, HstNode *node) {
   if (node->children) return false;
   HstTreeData *data = Data(tree);
   EsaArray kids = TransientHandle(tree, nullptr);
@@ -134,22 +168,15 @@ COFFER_API bool HSTAllocChild(HstTree *tree, HstNode *node) {
   return true;
 }
 
-COFFER_API HstNode *HSTInsertChildNode(HstTree *tree, HstNode *parent, HstNode *node) {
-  if (!parent->children && !HSTAllocChild(tree, parent)) return nullptr;
-  EsaArray kids = Children(tree, parent);
-  if (!ESA_Insert(&kids, HST_GetKey(tree, node), OffsetOf(tree, node))) return nullptr;
-  node->parent = OffsetOf(tree, parent);
-  return node;
-}
-
-COFFER_API HstNode *HST_InsertChild(HstTree *tree, HstNode *parent, const char *key,
-                                    CofferVal val) {
-  HST_CHECKED(tree);
-  if (!parent->children && !HSTAllocChild(tree, parent)) return nullptr;
-  HstNode *node = HSTAllocNode(tree, key, val);
+HstNode *InsertChild(HstTree *tree, HstNode *parent, const char *key, CofferVal val,
+                     int32_t slot) {
+  if (!parent->children && !AllocChildArray(tree, parent)) return nullptr;
+  HstNode *node = AllocNode(tree, key, val);
   if (!node) return nullptr;
   EsaArray kids = Children(tree, parent);
-  if (!ESA_Insert(&kids, key, OffsetOf(tree, node))) {
+  const PoolOffset off = OffsetOf(tree, node);
+  if (!(slot == kSlotAfterEqual ? ESA_Insert(&kids, key, off)
+                                : ESAInsertAt(&kids, slot, key, off))) {
     HSTFreeNode(tree, node);
     return nullptr;
   }
@@ -157,16 +184,5 @@ COFFER_API HstNode *HST_InsertChild(HstTree *tree, HstNode *parent, const char *
   return node;
 }
 
-COFFER_API void HSTFreeNode(HstTree *tree, HstNode *node) {
-  if (node->children) {
-    // Only the array goes: its entries' key copies, entry block and record.
-    // The child nodes they name are the caller's business.
-    EsaArray kids = Children(tree, node);
-    ESA_FreeArray(&kids);
-  }
-  PoolFree(tree, RecordAt<char>(tree, node->key));
-  PoolFree(tree, node);
-  Data(tree)->size--;
-}
-
-}  // extern "C"
+}  // namespace hst
+}  // namespace coffer

@@ -15,7 +15,7 @@ namespace {
 HstNode *WalkNames(HstTree *tree, char *copy, bool create) {
   HstTreeData *data = Data(tree);
   const char sep = data->separator;
-  HstNode *node = HST_GetRoot(tree);
+  HstNode *node = Root(tree);
   // An empty path has no first character to skip and names nothing.
   if (copy[0] == '\0') return nullptr;
   char *name = copy + 1;
@@ -23,8 +23,9 @@ HstNode *WalkNames(HstTree *tree, char *copy, bool create) {
   for (;;) {
     char *cut = FindCut(name, sep);
     if (cut) *cut = '\0';
-    HstNode *child = HST_FindChild(tree, node, name);
-    if (!child && create) child = HST_InsertChild(tree, node, name, data->defaultVal);
+    int32_t slot;
+    HstNode *child = FindChildIn(tree, node, name, &slot);
+    if (!child && create) child = InsertChild(tree, node, name, data->defaultVal, slot);
     if (cut) *cut = sep;
     if (!child) return nullptr;
     node = child;
@@ -62,7 +63,7 @@ COFFER_API HstNode *HST_Insert(HstTree *tree, const char *path, CofferVal val) {
   HST_CHECKED(tree);
   HstNode *node = WalkPath(tree, path, true);
   // The old value is overwritten, not released: replacing never releases.
-  if (node) HST_SetVal(tree, node, val);
+  if (node) node->val = val;
   return node;
 }
 

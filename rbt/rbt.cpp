@@ -10,6 +10,7 @@ namespace {
 
 struct StringKey {
   using Arg = const char *;
+  static constexpr bool kKeyInNode = false;
 
   static bool Acquire(RbtTree *tree, const char *key, uint32_t *word) {
     if (!key) return false;

@@ -2,6 +2,8 @@
 // key policy. A policy K provides:
 //
 //   using Arg                      the key as callers pass it
+//   kKeyInNode                     whether the node's key word is the key
+//                                  itself rather than a reference to it
 //   static bool Acquire(tree, key, uint32_t *word)
 //                                  makes the node's key word (the string
 //                                  family copies the key into the pool);
@@ -23,6 +25,19 @@
 
 namespace coffer {
 namespace rbt {
+
+// One step of a descent: compares the key with x's. A key kept outside the
+// node (K::kKeyInNode false) costs a second memory access at every step,
+// after the node's own; both children are then requested ahead, so that the
+// next node is on its way while the key is read and compared.
+template <class K>
+inline int Step(const RbtCtx &c, typename K::Probe &probe, const RbtNode *x) {
+  if (!K::kKeyInNode) {
+    Touch(c.NodeAt(x->left));
+    Touch(c.NodeAt(x->right));
+  }
+  return probe.Compare(x);
+}
 
 template <class K>
 RbtNode *InsertNode(RbtTree *tree, RbtNode *node, typename K::Arg key, CofferVal val) {
@@ -50,7 +65,7 @@ RbtNode *InsertNode(RbtTree *tree, RbtNode *node, typename K::Arg key, CofferVal
   bool left = false;
   for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
     y = c.NodeAt(xo);
-    left = probe.Compare(y) < 0;
+    left = Step<K>(c, probe, y) < 0;
     probe.Went(left);
     xo = ChildLink(y, !left);
   }
@@ -115,7 +130,7 @@ RbtNode *Find(RbtTree *tree, typename K::Arg key) {
   typename K::Probe probe(tree, key);
   for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
     RbtNode *x = c.NodeAt(xo);
-    int r = probe.Compare(x);
+    int r = Step<K>(c, probe, x);
     if (r == 0) return x;
     probe.Went(r < 0);
     xo = ChildLink(x, r > 0);
@@ -136,7 +151,7 @@ RbtNode *Bound(RbtTree *tree, typename K::Arg key) {
   RbtNode *bound = nullptr;
   for (PoolOffset xo = c.d->root; xo != c.nilOff;) {
     RbtNode *x = c.NodeAt(xo);
-    int r = probe.Compare(x);
+    int r = Step<K>(c, probe, x);
     const bool left = kPastEqual ? r < 0 : r <= 0;
     bound = left ? x : bound;
     probe.Went(left);

@@ -10,6 +10,7 @@ namespace {
 template <class Order, class ArgT>
 struct WordKey {
   using Arg = ArgT;
+  static constexpr bool kKeyInNode = true;
 
   static bool Acquire(RbtTree *, Arg key, uint32_t *word) {
     *word = Order::Word(key);
