@@ -43,13 +43,6 @@ void ReleaseHandle(CollectionHeader *h) {
   if (h->ownsHandle) h->mp.free(&h->mp, h);
 }
 
-void DropValue(CollectionHeader *h, CofferVal val) {
-  if (h->freeValFn)
-    h->freeValFn(val);
-  else if (h->mpFreeValFn)
-    h->mpFreeValFn(&h->mp, val);
-}
-
 FreeValFn SetFreeValFn(CollectionHeader *h, FreeValFn fn) {
   FreeValFn old = h->freeValFn;
   h->freeValFn = fn;

@@ -93,7 +93,12 @@ CollectionHeader *AllocHandle(MemPool *pool);
 void ReleaseHandle(CollectionHeader *h);
 
 // Gives a dropped value to whichever release callback is set.
-void DropValue(CollectionHeader *h, CofferVal val);
+inline void DropValue(CollectionHeader *h, CofferVal val) {
+  if (h->freeValFn)
+    h->freeValFn(val);
+  else if (h->mpFreeValFn)
+    h->mpFreeValFn(&h->mp, val);
+}
 
 FreeValFn SetFreeValFn(CollectionHeader *h, FreeValFn fn);
 MpFreeValFn SetMpFreeValFn(CollectionHeader *h, MpFreeValFn fn);

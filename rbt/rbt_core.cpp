@@ -48,10 +48,9 @@ inline void ReplaceChild(const RbtCtx &c, PoolOffset parent, PoolOffset old, Poo
     return;
   }
   RbtNode *p = c.NodeAt(parent);
-  if (p->left == old)
-    p->left = repl;
-  else
-    p->right = repl;
+  // The side is picked as an address, not by a branch on it (see ChildLink).
+  PoolOffset &link = p->left == old ? p->left : p->right;
+  link = repl;
 }
 
 inline uint8_t ColorOf(const RbtCtx &c, PoolOffset off) { return c.NodeAt(off)->color; }

@@ -60,13 +60,23 @@ inline PoolOffset ChildLink(const RbtNode *x, bool right) {
 
 // The walks below are inline: they are most of the work of the public
 // neighbour calls, which then convert and test only what they visit.
+//
+// A walk in order returns every node it passes on the way down, and every
+// node it climbs to, before it enters that node's far subtree. So each such
+// node's far child is loaded ahead (Touch) as soon as the node is reached:
+// in a tree larger than the cache, the walk then finds it there instead of
+// waiting for memory at every step.
 
 // The last node on side L below xo (the leftmost for L true); xo is not the
 // sentinel.
 template <bool L>
 inline RbtNode *RBTExtreme(const RbtCtx &c, PoolOffset xo) {
   RbtNode *x = c.NodeAt(xo);
-  for (PoolOffset next; (next = Near<L>(x)) != c.nilOff;) x = c.NodeAt(next);
+  Touch(c.NodeAt(Far<L>(x)));
+  for (PoolOffset next; (next = Near<L>(x)) != c.nilOff;) {
+    x = c.NodeAt(next);
+    Touch(c.NodeAt(Far<L>(x)));
+  }
   return x;
 }
 
@@ -80,7 +90,10 @@ inline RbtNode *RBTNeighbour(const RbtCtx &c, const RbtNode *x) {
   PoolOffset xo = c.OffsetOf(x);
   for (PoolOffset yo = x->parent; yo != c.nilOff;) {
     RbtNode *y = c.NodeAt(yo);
-    if (Far<L>(y) != xo) return y;
+    if (Far<L>(y) != xo) {
+      Touch(c.NodeAt(Far<L>(y)));
+      return y;
+    }
     xo = yo;
     yo = y->parent;
   }
