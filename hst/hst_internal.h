@@ -7,8 +7,6 @@
 
 #include <coffer/hst.h>
 
-#include <cstring>
-
 #include "esa/esa_internal.h"
 #include "mempool/check.h"
 #include "mempool/pool.h"

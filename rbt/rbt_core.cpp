@@ -1,6 +1,7 @@
 // Red-black balancing on a tree with a sentinel, shared by every key family:
-// neighbour walks, rotations, insertion fix-up, removal with successor
-// relinking, and the key-independent parts of the lifecycle.
+// rotations, insertion fix-up, removal with successor relinking, and the
+// key-independent parts of the lifecycle. The neighbour walks are inline, in
+// rbt_internal.h.
 //
 // The invariants every call below restores before it returns (RBTCheckTree
 // verifies them in checking builds):
