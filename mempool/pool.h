@@ -61,9 +61,9 @@ inline PoolOffset OffsetOf(const CollectionHeader *h, const void *p) {
 }
 
 // The same idiom for offsets that are never 0 and records that are never
-// null: the links inside a tree, where an absent node is the tree's sentinel,
-// and the entries of a child array. They skip the null test, which would
-// otherwise cost a branch at every step of every descent.
+// null: the links inside a red-black tree, where an absent node is the
+// tree's sentinel, and the key copies its nodes name. They skip the null
+// test, which would otherwise cost a branch at every step of every descent.
 template <class T>
 inline T *LinkedRecordAt(const CollectionHeader *h, PoolOffset off) {
   return static_cast<T *>(LinkedAddr(&h->mp, off));
