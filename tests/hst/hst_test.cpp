@@ -6,6 +6,7 @@
 #include <functional>
 
 #include "hst/hst_internal.h"
+#include "support/damage.h"
 #include "support/test_pool.h"
 
 namespace coffer_test {
@@ -67,58 +68,24 @@ TEST(Hst, DetachedNodes) {
   EXPECT_EQ(tp.held(), 0u);
 }
 
-// A copy whose third value cannot be made releases the two made before it,
-// and the default value of every node copied so far, children first.
-TEST(Hst, FailedCopyReleasesWhatItMade) {
-  HstTree *t = HST_AllocTree('/', 9, 1, 1);
-  HST_SetFreeValFn(t, RecordRelease);
-  for (const char *p : {"/s", "/s/a", "/s/a/x", "/s/b", "/s/c"}) HST_Insert(t, p, 9);
-  for (CofferVal v : {1, 2, 3}) HST_SetVal(t, HST_Find(t, v == 1 ? "/s/a" : v == 2 ? "/s/a/x" : "/s/b"), v);
-  Releases().clear();
-  static int calls;
-  HstCloneValFn third = [](HstTree *, CofferVal v, CofferVal *out) { return *out = v + 100, ++calls < 3; };
-  EXPECT_EQ(HST_CloneSubtree(t, HST_Find(t, "/s"), third, "d", HST_GetRoot(t)), nullptr);
-  EXPECT_EQ(ReleasedVals(), (std::vector<CofferVal>{102, 101, 9}));
-  EXPECT_EQ(HST_GetSize(t), 6);
-  EXPECT_EQ(HST_GetNumChildren(t, HST_GetRoot(t)), 1);
-  HST_FreeTree(t);
-}
-
-TEST(Hst, CheckerFiresOnEachDamage) {
-  HstTree *t = HST_AllocTree('/', 0, 2, 2);
+TEST(Hst, CheckerFindsEachDamage) {
+  RegionPool r(1024);
+  HstTree *t = HST_AllocTreeEx(&r.pool, '/', 0, 2, 2);
   for (const char *p : {"/a/b", "/a/c", "/d"}) HST_Insert(t, p, 0);
   HstNode *a = HST_Find(t, "/a"), *b = HST_Find(t, "/a/b"), *root = HST_GetRoot(t);
-  auto *kids = coffer::RecordAt<EsaArrayData>(t, a->children);
-  auto *entries = coffer::RecordAt<EsaEntry>(t, kids->entries);
-  const struct {
-    const char *what;
-    bool counts;
-    std::function<void()> damage;
-  } kDamage[] = {
-      {"root missing, named or with a parent", false, [&] { root->parent = a->parent; }},
-      {"node without a name", false, [&] { b->key = 0; }},
-      {"keys out of order", false, [&] { std::swap(entries[0], entries[1]); }},
-      {"child entry names no node", false, [&] { entries[1].val = 0; }},
-      {"parent link disagrees with child entry", false, [&] { b->parent = b->children; }},
-      {"child entry named unlike its node", false, [&] { entries[0].key = entries[1].key; }},
-      {"more nodes than size counts", false, [&] { static_cast<HstTreeData *>(t->data)->size = 2; }},
-      {"size differs from the nodes reachable", false, [&] { static_cast<HstTreeData *>(t->data)->size = 9; }},
-      {"negative value count", true, [&] { b->subtreeValCount = -1; }},
-      {"value count below its children's", true, [&] { b->subtreeValCount = 1; }},
-  };
-  coffer::CheckFault fault;
-  for (const auto &row : kDamage) {
-    const HstNode savedRoot = *root, savedB = *b;
-    const HstTreeData savedData = *static_cast<HstTreeData *>(t->data);
-    const EsaEntry savedEntries[2] = {entries[0], entries[1]};
-    ASSERT_TRUE(coffer::hst::HSTCheckTree(t, true, &fault));
-    row.damage();
-    EXPECT_FALSE(coffer::hst::HSTCheckTree(t, row.counts, &fault)) << row.what;
-    EXPECT_STREQ(fault.what, row.what);
-    *root = savedRoot, *b = savedB, *static_cast<HstTreeData *>(t->data) = savedData;
-    entries[0] = savedEntries[0], entries[1] = savedEntries[1];
-  }
-  HST_FreeTree(t);
+  auto *data = static_cast<HstTreeData *>(t->data);
+  auto *e = coffer::RecordAt<EsaEntry>(t, coffer::RecordAt<EsaArrayData>(t, a->children)->entries);
+  ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::hst::HSTCheckTree(t, true, f); },
+                  {{"root missing, named or with a parent", [&] { root->parent = a->parent; }},
+                   {"node without a name", [&] { b->key = 0; }},
+                   {"keys out of order", [&] { std::swap(e[0], e[1]); }},
+                   {"child entry names no node", [&] { e[1].val = 0; }},
+                   {"parent link disagrees with child entry", [&] { b->parent = 0; }},
+                   {"child entry named unlike its node", [&] { e[0].key = e[1].key; }},
+                   {"more nodes than size counts", [&] { data->size = 2; }},
+                   {"size differs from the nodes reachable", [&] { data->size = 9; }},
+                   {"negative value count", [&] { b->subtreeValCount = -1; }},
+                   {"value count below its children's", [&] { b->subtreeValCount = 1; }}});
 }
 
 }  // namespace

@@ -6,6 +6,7 @@
 #include <functional>
 
 #include "rbt/rbt_internal.h"
+#include "support/damage.h"
 #include "support/test_pool.h"
 
 namespace coffer_test {
@@ -67,43 +68,23 @@ TEST(Rbt, SwapCarriesTheSentinelAndItsOwnership) {
   EXPECT_EQ(tp.misuse, "");
 }
 
-TEST(Rbt, CheckerFiresOnEachDamage) {
-  RbtTree *t = RbtInt32_AllocTree();
+TEST(Rbt, CheckerFindsEachDamage) {
+  RegionPool r(1024);
+  RbtTree *t = RbtInt32_AllocTreeEx(&r.pool);
   for (int32_t k : {4, 2, 6, 1, 3, 5, 7, 8}) RbtInt32_Insert(t, k, 0);
   auto *d = static_cast<RbtTreeData *>(t->data);
   auto node = [&](int32_t k) { return RbtInt32_Find(t, k); };
-  const struct {
-    const char *what;
-    std::function<void()> damage;
-  } kDamage[] = {
-      {"sentinel changed", [&] { coffer::RecordAt<RbtNode>(t, d->nil)->color = 1; }},
-      {"red root", [&] { node(4)->color = 1; }},
-      {"red node with a red child", [&] { node(7)->color = 1; }},
-      {"black heights differ", [&] { node(1)->color = 1 - node(1)->color; }},
-      {"colour neither red nor black", [&] { node(5)->color = 2; }},
-      {"parent link disagrees with child link", [&] { node(3)->parent = d->nil; }},
-      {"keys out of order", [&] { node(3)->key = 9; }},
-      {"more nodes than size counts", [&] { d->size = 2; }},
-      {"size differs from the nodes reachable", [&] { d->size = 9; }},
-      {"a link is 0 instead of the sentinel", [&] { node(8)->left = 0; }},
-  };
-  coffer::CheckFault fault;
-  for (const auto &row : kDamage) {
-    std::vector<RbtNode> saved;
-    for (int32_t k = 1; k <= 8; k++) saved.push_back(*node(k));
-    const RbtTreeData savedData = *d;
-    const RbtNode savedNil = *coffer::RecordAt<RbtNode>(t, d->nil);
-    ASSERT_TRUE(coffer::RBTCheckTree(t, coffer::kRbtInt32Keys, &fault));
-    std::vector<RbtNode *> nodes;
-    for (int32_t k = 1; k <= 8; k++) nodes.push_back(node(k));
-    row.damage();
-    EXPECT_FALSE(coffer::RBTCheckTree(t, coffer::kRbtInt32Keys, &fault)) << row.what;
-    EXPECT_STREQ(fault.what, row.what);
-    *d = savedData;
-    *coffer::RecordAt<RbtNode>(t, d->nil) = savedNil;
-    for (size_t i = 0; i < nodes.size(); i++) *nodes[i] = saved[i];
-  }
-  RbtInt32_FreeTree(t);
+  ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::RBTCheckTree(t, coffer::kRbtInt32Keys, f); },
+                  {{"sentinel changed", [&] { coffer::RecordAt<RbtNode>(t, d->nil)->color = 1; }},
+                   {"red root", [&] { node(4)->color = 1; }},
+                   {"red node with a red child", [&] { node(7)->color = 1; }},
+                   {"black heights differ", [&] { node(1)->color = 1 - node(1)->color; }},
+                   {"colour neither red nor black", [&] { node(5)->color = 2; }},
+                   {"parent link disagrees with child link", [&] { node(3)->parent = d->nil; }},
+                   {"keys out of order", [&] { node(3)->key = 9; }},
+                   {"more nodes than size counts", [&] { d->size = 2; }},
+                   {"size differs from the nodes reachable", [&] { d->size = 9; }},
+                   {"a link is 0 instead of the sentinel", [&] { node(8)->left = 0; }}});
 }
 
 }  // namespace

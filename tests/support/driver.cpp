@@ -25,28 +25,34 @@ std::vector<uint8_t> RandomBytes(uint32_t seed, size_t n) {
   return v;
 }
 
-std::string Differs(const char *file, int line, const char *what) {
-  return std::string(file) + ":" + std::to_string(line) + ": " + what;
+std::string RunOnTestPool(const std::function<std::string(Arena)> &run, long failAt) {
+  TestPool tp;
+  tp.FailAt(failAt);
+  std::string e = run(Arena{tp.pool(), &tp});
+  if (e.empty() && tp.held()) e = std::to_string(tp.held()) + " blocks leaked";
+  return e.empty() ? tp.misuse : e;
 }
 
 std::string ForEachFailure(const std::function<std::string(Arena)> &run) {
   for (long n = 0;; n++) {
-    TestPool tp;
-    tp.FailAt(n);
-    std::string e = run(Arena{tp.pool(), &tp});
-    if (e.empty() && tp.held()) e = std::to_string(tp.held()) + " blocks leaked";
-    if (e.empty()) e = tp.misuse;
+    long calls = 0;
+    std::string e = RunOnTestPool([&](Arena a) {
+      std::string got = run(a);
+      calls = a.tp->calls();
+      return got;
+    }, n);
     if (!e.empty()) return "refusing call " + std::to_string(n) + ": " + e;
-    if (tp.calls() <= n) return "";
+    if (calls <= n) return "";
   }
 }
 
-int FuzzModel(std::string (*run)(Ops &, Arena), const uint8_t *data, size_t size) {
-  TestPool tp;
-  Ops ops(data, size);
-  std::string e = run(ops, Arena{tp.pool(), &tp});
-  if (e.empty() && tp.held()) e = std::to_string(tp.held()) + " blocks leaked";
-  if (e.empty()) e = tp.misuse;
+int FuzzModel(const uint8_t *data, size_t size) {
+  static const Runner kRunners[] = {RunEsaModel, RunRbtModel, RunHstModel, RunHstaaModel};
+  if (size == 0) return 0;
+  std::string e = RunOnTestPool([&](Arena a) {
+    Ops ops(data + 1, size - 1);
+    return kRunners[data[0] % 4](ops, a);
+  });
   if (!e.empty()) std::fprintf(stderr, "%s\n", e.c_str()), std::abort();
   return 0;
 }

@@ -17,30 +17,26 @@ namespace coffer_test {
 class Ops {
  public:
   Ops(const uint8_t *data, size_t size) : p_(data), end_(data + size) {}
-  explicit Ops(std::vector<uint8_t> bytes)
-      : own_(std::move(bytes)), p_(own_.data()), end_(p_ + own_.size()) {}
+  explicit Ops(std::vector<uint8_t> bytes) : own_(std::move(bytes)), p_(own_.data()), end_(p_ + own_.size()) {}
   bool More() const { return p_ < end_; }
-  // A number below n (n at most 65536), 0 once the bytes have run out.
-  uint32_t Take(uint32_t n);
-  // Up to maxLen characters of alphabet.
+  uint32_t Take(uint32_t n);  // below n (at most 65536); 0 once the bytes run out
   std::string Key(const std::string &alphabet, uint32_t maxLen);
 
  private:
   std::vector<uint8_t> own_;
   const uint8_t *p_, *end_;
 };
-
 std::vector<uint8_t> RandomBytes(uint32_t seed, size_t n);
 
 // Where a model runs: a pool, and the TestPool behind it when there is one,
-// which lets the model refuse allocations and see key sizes.
+// through which the model refuses allocations and sees key sizes.
 struct Arena {
   MemPool *pool;
   TestPool *tp;
 };
 
-// What one operation met: whether the pool refused one of its calls, and
-// which (counted from the operation's first call).
+// Whether the pool refused one of an operation's calls, and which (counted
+// from the operation's first call).
 struct OpWatch {
   TestPool *tp;
   long start;
@@ -51,31 +47,25 @@ struct OpWatch {
 
 // A runner returns "" when the library agreed with its model throughout,
 // else where they first differed.
-std::string Differs(const char *file, int line, const char *what);
-#define MODEL_EXPECT(cond) \
-  do {                     \
-    if (!(cond)) return coffer_test::Differs(__FILE__, __LINE__, #cond); \
-  } while (0)
-#define MODEL_TRY(call)              \
-  do {                               \
-    std::string e_ = (call);         \
-    if (!e_.empty()) return e_;      \
-  } while (0)
-
+using Runner = std::string (*)(Ops &, Arena);
 std::string RunEsaModel(Ops &ops, Arena arena);
 std::string RunRbtModel(Ops &ops, Arena arena);  // the first byte picks the family
 std::string RunHstModel(Ops &ops, Arena arena);
 std::string RunHstaaModel(Ops &ops, Arena arena);
+#define MODEL_EXPECT(cond) \
+  if (!(cond)) return std::string(__FILE__ ":") + std::to_string(__LINE__) + ": " #cond
+#define MODEL_TRY(call) \
+  if (std::string e_ = (call); !e_.empty()) return e_
 
-// The failure-injection driver: runs run on a fresh TestPool with its
-// allocation call n refused, for every n up to the first run that makes no
-// call n. After each run the pool must hold nothing and have seen no
-// double release.
+// Runs run on a TestPool and adds what the pool saw: a leak or a double
+// release. With failAt, the pool refuses that allocation call.
+std::string RunOnTestPool(const std::function<std::string(Arena)> &run, long failAt = -1);
+// The failure-injection driver: RunOnTestPool with call n refused, for every
+// n up to the first run that makes no call n.
 std::string ForEachFailure(const std::function<std::string(Arena)> &run);
-
-// A fuzz target's body: runs a model on the fuzzer's bytes over a TestPool
-// and aborts, saying why, on any disagreement, leak or double release.
-int FuzzModel(std::string (*run)(Ops &, Arena), const uint8_t *data, size_t size);
+// A fuzz target's body: a runner on the fuzzer's bytes, aborting with the
+// reason on any disagreement.
+int FuzzModel(const uint8_t *data, size_t size);
 
 }  // namespace coffer_test
 

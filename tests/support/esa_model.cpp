@@ -51,10 +51,16 @@ std::string Compare(EsaArray *a, const Model &m, TestPool *tp) {
 
 std::string RunEsaModel(Ops &ops, Arena arena) {
   static const std::string kAlphabet("abB0\x80\xff", 6);
-  Model m{{}, static_cast<int32_t>(ops.Take(6)), static_cast<int32_t>(ops.Take(7)) - 2};
+  // Capacities and increments include those the array cannot use: a
+  // negative capacity, one whose bytes overflow, increments below 1 (which
+  // count as 1) and increments whose growth would overflow.
+  static const int32_t kIncrements[] = {-2, -1, 0, 1, 2, 3, 4, INT32_MAX, 0x20000000};
+  Model m{{}, static_cast<int32_t>(ops.Take(8)) - 2, kIncrements[ops.Take(7)]};
+  if (ops.Take(16) == 0) m.cap = 0x20000000;
   OpWatch made(arena.tp);
   EsaArray *a = ESA_AllocArrayEx(arena.pool, m.cap, m.inc);
-  if (!a) return made.Refused() ? "" : "creation failed unrefused";
+  if (!a) return made.Refused() || m.cap < 0 || m.cap == 0x20000000 ? "" : "creation failed unrefused";
+  MODEL_EXPECT(m.cap >= 0 && m.cap < 0x20000000);
   ESA_SetFreeValFn(a, RecordRelease);
   for (CofferVal next = 1; ops.More(); next++) {
     Releases().clear();
@@ -65,9 +71,11 @@ std::string RunEsaModel(Ops &ops, Arena arena) {
     if (kind < 6) {  // insert
       std::string k = ops.Key(kAlphabet, 3);
       const bool full = n == m.cap;
+      // A growth past int32 or 32-bit bytes is refused before any pool call.
+      const bool fits = !full || int64_t{n} + m.Step() <= 0x1FFFFFFF;
       const bool ok = ESA_Insert(a, k.c_str(), next);
-      MODEL_EXPECT(ok != op.Refused());
-      if (full && op.RefusedCall() != 0) m.cap += m.Step();  // a refused key copy keeps the growth
+      MODEL_EXPECT(ok == (fits && !op.Refused()) && (fits || !arena.tp || arena.tp->calls() == op.start));
+      if (full && fits && op.RefusedCall() != 0) m.cap += m.Step();  // a refused key copy keeps the growth
       if (ok) m.e.insert(std::upper_bound(m.e.begin(), m.e.end(), k, [](auto &x, auto &y) { return Less(x, y.first); }), {k, next});
     } else if (kind < 11) {  // remove one, a range or all
       int32_t f = static_cast<int32_t>(ops.Take(n + 3)) - 1;
@@ -92,7 +100,7 @@ std::string RunEsaModel(Ops &ops, Arena arena) {
     } else if (arena.tp && ops.Take(2)) {
       arena.tp->FailAt(arena.tp->calls());
     } else {
-      m.inc = static_cast<int32_t>(ops.Take(7)) - 2;
+      m.inc = kIncrements[ops.Take(9)];
       ESA_SetCapacityIncrement(a, m.inc);
     }
     MODEL_EXPECT(ReleasedVals() == dropped);

@@ -5,82 +5,58 @@
 #include <cstring>
 
 namespace coffer_test {
+namespace {
+TestPool *From(MemPool *pool) { return static_cast<TestPool *>(pool->lock); }
+std::string g_log;
+bool g_logging = false;
+}  // namespace
 
 TestPool::TestPool(uintptr_t base) {
   record_ = MemPool{Alloc, Calloc, Realloc, Free, reinterpret_cast<void *>(base), this};
 }
-
 TestPool::~TestPool() {
   for (auto &b : blocks_) std::free(b.first);
 }
-
 size_t TestPool::SizeOf(const void *p) const {
   auto it = blocks_.find(const_cast<void *>(p));
   return it == blocks_.end() ? 0 : it->second;
 }
 
-bool TestPool::Refuse() {
-  if (calls_++ != failAt_) return false;
-  lastRefused_ = failAt_;
-  return true;
+void *TestPool::Grant(void *p, size_t size) {
+  if (calls_++ == failAt_) return std::free(p), lastRefused_ = failAt_, nullptr;
+  blocks_[p] = size;
+  return p;
 }
-
 void *TestPool::Alloc(MemPool *pool, size_t size) {
-  TestPool *tp = From(pool);
   LogCall("a" + std::to_string(size));
-  if (tp->Refuse()) return nullptr;
-  void *p = std::malloc(size ? size : 1);
-  tp->blocks_[p] = size;
-  return p;
+  return From(pool)->Grant(std::malloc(size + 1), size);
 }
-
 void *TestPool::Calloc(MemPool *pool, size_t count, size_t size) {
-  TestPool *tp = From(pool);
   LogCall("c" + std::to_string(count) + "x" + std::to_string(size));
-  if (tp->Refuse()) return nullptr;
-  void *p = std::calloc(1, count * size != 0 ? count * size : 1);
-  tp->blocks_[p] = count * size;
-  return p;
+  return From(pool)->Grant(std::calloc(1, count * size + 1), count * size);
 }
-
 void *TestPool::Realloc(MemPool *pool, void *ptr, size_t size) {
   TestPool *tp = From(pool);
   LogCall((ptr ? "r" : "r0:") + std::to_string(size));
   if (ptr && !tp->blocks_.count(ptr)) tp->misuse += "realloc of a block not held; ";
-  if (size == 0) {
-    if (ptr) std::free(ptr), tp->blocks_.erase(ptr);
-    return nullptr;
-  }
-  if (tp->Refuse()) return nullptr;
-  void *p = std::malloc(size);
-  if (ptr) {
-    std::memcpy(p, ptr, std::min(tp->blocks_[ptr], size));
+  void *p = size ? tp->Grant(std::malloc(size), size) : nullptr;
+  if (ptr && (p || !size)) {  // a refused realloc keeps the block
+    if (p) std::memcpy(p, ptr, std::min(tp->blocks_[ptr], size));
     tp->blocks_.erase(ptr);
     std::free(ptr);
   }
-  tp->blocks_[p] = size;
   return p;
 }
-
 void TestPool::Free(MemPool *pool, void *ptr) {
   // Everything is read before the release: the record may lie in the block.
   TestPool *tp = From(pool);
   LogCall(ptr ? "f" : "f0");
-  if (!ptr) return;
-  if (!tp->blocks_.erase(ptr)) return void(tp->misuse += "free of a block not held; ");
+  if (ptr && !tp->blocks_.erase(ptr)) return void(tp->misuse += "free of a block not held; ");
   std::free(ptr);
 }
 
-namespace {
-std::string g_log;
-bool g_logging = false;
-}  // namespace
-
 void StartCallLog() { g_log.clear(), g_logging = true; }
-std::string TakeCallLog() {
-  g_logging = false;
-  return std::move(g_log);
-}
+std::string TakeCallLog() { return g_logging = false, std::move(g_log); }
 void LogCall(const std::string &entry) {
   if (g_logging) g_log += (g_log.empty() ? "" : " ") + entry;
 }

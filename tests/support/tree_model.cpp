@@ -14,6 +14,8 @@
 namespace coffer_test {
 namespace {
 
+using Names = std::vector<std::string>;
+
 struct MNode {
   MNode(std::string k, CofferVal v) : key(std::move(k)), val(v) {}
   std::string key;
@@ -25,28 +27,30 @@ struct MNode {
   HstNode *lib = nullptr;  // the library's node, once compared
 };
 
-int Nodes(const MNode *n) {
-  int c = 1;
-  for (auto &k : n->kids) c += Nodes(k.second.get());
-  return c;
-}
-int Held(const MNode *n) {
-  int c = n->held;
-  for (auto &k : n->kids) c += Held(k.second.get());
-  return c;
-}
-void Collect(MNode *n, std::vector<MNode *> *all) {
-  all->push_back(n);
-  for (auto &k : n->kids) Collect(k.second.get(), all);
+std::unique_ptr<MNode> New(CofferVal val) { return std::make_unique<MNode>("", val); }
+MNode *Attach(MNode *parent, std::unique_ptr<MNode> n, const std::string &key) {
+  n->key = key;
+  n->parent = parent;
+  return (parent->kids[key] = std::move(n)).get();
 }
 MNode *Child(MNode *n, const std::string &k) {
   auto it = n->kids.find(k);
   return it == n->kids.end() ? nullptr : it->second.get();
 }
-MNode *Attach(MNode *parent, std::unique_ptr<MNode> n, const std::string &key) {
-  n->key = key;
-  n->parent = parent;
-  return (parent->kids[key] = std::move(n)).get();
+MNode *Lookup(MNode *n, const Names &names) {
+  for (const std::string &k : names)
+    if (!(n = Child(n, k))) return nullptr;
+  return n;
+}
+HstNode *LibOf(MNode *n) { return n ? n->lib : nullptr; }
+int Sum(const MNode *n, int MNode::*field) {  // nodes (field null) or values held
+  int c = field ? n->*field : 1;
+  for (auto &k : n->kids) c += Sum(k.second.get(), field);
+  return c;
+}
+void Collect(MNode *n, std::vector<MNode *> *all) {
+  all->push_back(n);
+  for (auto &k : n->kids) Collect(k.second.get(), all);
 }
 
 // Every callback and release, in order: I(nsert) and R(emove) of an operand
@@ -71,13 +75,18 @@ bool Apply(char what, CofferVal cur, CofferVal op, CofferVal *out) {
 }
 bool CloneVal(HstTree *, CofferVal v, CofferVal *out) { return Apply('C', v, 0, out); }
 void Release(CofferVal v) { g_log.push_back("F" + std::to_string(v)); }
+// Releasing n's subtree: children in name order, each before its parent.
+void LogReleases(const MNode *n) {
+  for (auto &k : n->kids) LogReleases(k.second.get());
+  Release(n->val);
+}
 
 // The library's tree against the model's, node by node; wires up lib.
 std::string Compare(HstTree *t, HstNode *h, MNode *m, bool derived, TestPool *tp) {
   m->lib = h;
   MODEL_EXPECT(HST_GetKey(t, h) == m->key && HST_GetVal(t, h) == m->val);
   MODEL_EXPECT(!tp || tp->SizeOf(HST_GetKey(t, h)) == m->key.size() + 1);
-  MODEL_EXPECT(h->subtreeValCount == (derived ? Held(m) : m->count));
+  MODEL_EXPECT(h->subtreeValCount == (derived ? Sum(m, &MNode::held) : m->count));
   MODEL_EXPECT(HST_GetNumChildren(t, h) == static_cast<int32_t>(m->kids.size()));
   int32_t i = 0;
   for (auto &k : m->kids) {
@@ -89,19 +98,29 @@ std::string Compare(HstTree *t, HstNode *h, MNode *m, bool derived, TestPool *tp
   return "";
 }
 std::string CompareTree(HstTree *t, MNode *root, bool derived, TestPool *tp) {
-  MODEL_EXPECT(HST_GetParent(t, HST_GetRoot(t)) == nullptr && HST_GetSize(t) == Nodes(root));
+  MODEL_EXPECT(HST_GetParent(t, HST_GetRoot(t)) == nullptr && HST_GetSize(t) == Sum(root, nullptr));
   coffer::CheckFault fault;
   MODEL_EXPECT(coffer::hst::HSTCheckTree(t, derived, &fault));
   return Compare(t, HST_GetRoot(t), root, derived, tp);
+}
+// Frees the tree: every value released once, children before parents.
+std::string FreeTree(HstTree *t, MNode *root) {
+  g_log.clear();
+  HST_FreeTree(t);
+  std::vector<std::string> freed;
+  std::swap(freed, g_log);
+  LogReleases(root);
+  MODEL_EXPECT(freed == g_log);
+  return "";
 }
 
 // Path text over names that never hold the separator, now and then with a
 // separator at the end; the first character is never examined.
 struct Path {
-  std::vector<std::string> names;
+  Names names;
   std::string text;
 };
-Path MakePath(Ops &ops, char sep, const std::vector<std::string> &names) {
+Path MakePath(Ops &ops, char sep, const Names &names) {
   Path p;
   for (uint32_t d = ops.Take(4); d; --d) {
     std::string k = names[ops.Take(names.size())];
@@ -120,137 +139,6 @@ Path MakePath(Ops &ops, char sep, const std::vector<std::string> &names) {
   return p;
 }
 
-MNode *Lookup(MNode *n, const std::vector<std::string> &names) {
-  for (const std::string &k : names)
-    if (!(n = Child(n, k))) return nullptr;
-  return n;
-}
-HstNode *LibOf(MNode *n) { return n ? n->lib : nullptr; }
-
-std::unique_ptr<MNode> New(CofferVal val) { return std::make_unique<MNode>("", val); }
-
-// What releasing n's subtree logs: children in name order, each before its
-// parent.
-void LogReleases(const MNode *n, std::vector<std::string> *log) {
-  for (auto &k : n->kids) LogReleases(k.second.get(), log);
-  log->push_back("F" + std::to_string(n->val));
-}
-
-// The string tree's copy of n: values other than the default through the
-// clone callback (v becomes v + 1000), counts as they were.
-std::unique_ptr<MNode> Copy(const MNode *n, CofferVal dv) {
-  auto c = New(n->val == dv ? dv : n->val + 1000);
-  c->count = n->count;
-  for (auto &k : n->kids) Attach(c.get(), Copy(k.second.get(), dv), k.first);
-  return c;
-}
-
-}  // namespace
-
-std::string RunHstModel(Ops &ops, Arena arena) {
-  static const char kSeps[] = {'/', '.', '\0'};
-  static const std::vector<std::string> kNames = {"a", "b", "ab", "", "/", "."};
-  const char sep = kSeps[ops.Take(3)];
-  const CofferVal dv = ops.Take(2) ? 0 : 7;
-  OpWatch made(arena.tp);
-  HstTree *t = HST_AllocTreeEx(arena.pool, sep, dv, ops.Take(3), ops.Take(4) - 1);
-  if (!t) return made.Refused() ? "" : "creation failed unrefused";
-  HST_SetFreeValFn(t, Release);
-  MNode root{"", dv};
-  MODEL_TRY(CompareTree(t, &root, false, arena.tp));
-  for (CofferVal next = 1; ops.More(); next++) {
-    g_log.clear();
-    std::vector<std::string> want;
-    std::vector<MNode *> all;
-    Collect(&root, &all);
-    MNode *x = all[ops.Take(all.size())], *y = all[ops.Take(all.size())];
-    OpWatch op(arena.tp);
-    const uint32_t kind = ops.Take(16);
-    Path p = MakePath(ops, sep, kNames);
-    const std::string text = (ops.Take(2) ? "/" : "x") + p.text;
-    if (kind < 4) {  // insert at a path: missing names made with the default value
-      HstNode *got = HST_Insert(t, text.c_str(), next);
-      MNode *n = &root;
-      bool whole = true;
-      for (const std::string &k : p.names) {
-        MNode *c = Child(n, k);
-        HstNode *h = HST_FindChild(t, n->lib, k.c_str());
-        if (!c && h) (c = Attach(n, New(dv), k))->lib = h;  // made by this call
-        if (!(whole = c != nullptr)) break;  // refused here: what was made stays
-        n = c;
-      }
-      MODEL_EXPECT(!got == op.Refused() && (!got || (whole && got == n->lib)));
-      if (got) n->val = next;
-    } else if (kind < 6) {  // find, through a path or by name
-      MODEL_EXPECT(HST_Find(t, text.c_str()) == LibOf(Lookup(&root, p.names)));
-      MODEL_EXPECT(HST_FindChild(t, x->lib, p.text.c_str()) == LibOf(Child(x, p.text)));
-    } else if (kind < 8 && !Child(x, p.text)) {  // a new child by name
-      HstNode *got = HST_InsertChild(t, x->lib, p.text.c_str(), next);
-      MODEL_EXPECT(!got == op.Refused());
-      if (got) Attach(x, New(next), p.text);
-    } else if (kind < 10) {  // remove a subtree; the root's empties the tree
-      LogReleases(x, &want);
-      HST_RemoveSubtree(t, x->lib);
-      if (x == &root) root.kids.clear(), root.val = dv, root.count = 0;
-      if (x != &root) x->parent->kids.erase(x->key);
-    } else if (kind < 12 && x != &root) {  // copy x's subtree under y, maybe renamed
-      const std::string key = ops.Take(2) ? p.text : x->key;
-      g_b.refuseClone = ops.Take(3) ? -1 : static_cast<int>(ops.Take(next) % 1000);
-      if (Child(y, key)) continue;  // sibling names stay unique
-      std::vector<MNode *> src;
-      Collect(x, &src);
-      std::vector<std::string> clones;  // parents first, siblings in name order
-      bool refuses = false;
-      for (MNode *n : src) {
-        if (n->val == dv || refuses) continue;
-        clones.push_back("C" + std::to_string(n->val) + ",0");
-        refuses = static_cast<int>(n->val % 1000) == g_b.refuseClone;
-      }
-      HstNode *got = HST_CloneSubtree(t, x->lib, CloneVal, key == x->key ? nullptr : key.c_str(), y->lib);
-      MODEL_EXPECT(!got == (op.Refused() || refuses));
-      // A failed copy releases every value it made, and only those.
-      std::map<CofferVal, int> copies;
-      std::vector<std::string> calls;
-      for (const std::string &e : g_log) {
-        CofferVal v = std::stoul(e.substr(1));
-        if (e[0] == 'C') calls.push_back(e);
-        if (e[0] == 'C' && static_cast<int>(v % 1000) != g_b.refuseClone) copies[v + 1000]++;
-        if (e[0] == 'F' && v != dv) copies[v]--;
-      }
-      for (auto &c : copies) MODEL_EXPECT(got || c.second == 0);
-      MODEL_EXPECT(!got || g_log == clones);
-      MODEL_EXPECT(calls.size() <= clones.size() && std::equal(calls.begin(), calls.end(), clones.begin()));
-      MODEL_EXPECT(op.Refused() || calls.size() == clones.size());
-      if (got) Attach(y, Copy(x, dv), key);
-      g_b.refuseClone = -1;
-      want = g_log;  // checked above
-    } else if (kind < 13) {  // replace a value: never released
-      HST_SetVal(t, x->lib, next);
-      x->val = next;
-    } else if (kind < 14) {  // the count the arrays keep, carried up to the root
-      int32_t delta = static_cast<int32_t>(ops.Take(5)) - 2;
-      HSTAAAdjustSubtreeValCount(t, x->lib, delta);
-      for (MNode *n = x; n; n = n->parent) n->count += delta;
-    } else if (kind < 15) {  // clear: the root's value goes last
-      LogReleases(&root, &want);
-      HST_Clear(t);
-      root.kids.clear(), root.val = dv, root.count = 0;
-    } else if (arena.tp) {
-      arena.tp->FailAt(arena.tp->calls());
-    }
-    MODEL_EXPECT(g_log == want);
-    MODEL_TRY(CompareTree(t, &root, false, arena.tp));
-  }
-  std::vector<std::string> want;
-  LogReleases(&root, &want);
-  g_log.clear();
-  HST_FreeTree(t);
-  MODEL_EXPECT(g_log == want);
-  return "";
-}
-
-namespace {
-
 // The array a key is an element of: "#", "##", or "" for none.
 std::string MarkOf(const std::string &k) {
   if (k.size() >= 3 && k[0] == '#' && k[1] == '#') return "##";
@@ -258,28 +146,31 @@ std::string MarkOf(const std::string &k) {
 }
 bool IsMark(const std::string &k) { return k == "#" || k == "##"; }
 
-// The associative arrays' algorithms, restated on the reference tree.
-struct AaModel {
+// Both layers' algorithms, restated on the reference tree.
+struct Model {
   CofferVal dv;
   MNode root{"", dv};
 
   void Drop(MNode *n) {
-    LogReleases(n, &g_log);
+    LogReleases(n);
+    if (n == &root) return void((root.kids.clear(), root.val = dv, root.count = 0));
     n->parent->kids.erase(n->key);
   }
-  // A copy built parent first; a refused value releases the partial copy.
+  // The string tree's copy: parents first, values other than the default
+  // through the callback, counts as they were. A refused value releases
+  // the partial copy.
   std::unique_ptr<MNode> Clone(const MNode *src) {
     auto n = New(dv);
-    n->held = src->held;
+    n->held = src->held, n->count = src->count;
     if (src->val != dv && !Apply('C', src->val, 0, &n->val)) return nullptr;
     for (auto &k : src->kids) {
       auto c = Clone(k.second.get());
-      if (!c) return LogReleases(n.get(), &g_log), nullptr;
+      if (!c) return LogReleases(n.get()), nullptr;
       Attach(n.get(), std::move(c), k.first);
     }
     return n;
   }
-  MNode *Insert(MNode *node, const std::vector<std::string> &p, size_t i, CofferVal val) {
+  MNode *Insert(MNode *node, const Names &p, size_t i, CofferVal val) {
     MNode *made = nullptr;
     for (; i < p.size(); i++) {
       const std::string &k = p[i];
@@ -300,7 +191,7 @@ struct AaModel {
     if (made) Drop(made);
     return nullptr;
   }
-  void Remove(MNode *node, const std::vector<std::string> &p, size_t i, CofferVal val) {
+  void Remove(MNode *node, const Names &p, size_t i, CofferVal val) {
     if (i == p.size()) {
       if (Apply('R', node->val, val, &node->val)) node->held--;
       return;
@@ -311,11 +202,12 @@ struct AaModel {
     if (IsMark(k)) Propagate(HSTAA_PROPAGATE_REMOVE, node, k, p, i + 1, val);
     Remove(child, p, i + 1, val);
     MNode *rep = MarkOf(k).empty() ? nullptr : Child(node, MarkOf(k));
-    if (Held(child) == 0 || (rep && Held(rep) == Held(child))) Drop(child);
+    const int n = Sum(child, &MNode::held);
+    if (n == 0 || (rep && Sum(rep, &MNode::held) == n)) Drop(child);
   }
   // Elements follow their template in key order: visit that run only.
-  bool Propagate(int mode, MNode *parent, const std::string &mark,
-                 const std::vector<std::string> &p, size_t i, CofferVal val) {
+  bool Propagate(int mode, MNode *parent, const std::string &mark, const Names &p, size_t i,
+                 CofferVal val) {
     for (std::string at = mark;;) {
       auto it = parent->kids.upper_bound(at);
       if (it == parent->kids.end() || MarkOf(it->first) != mark) return true;
@@ -324,11 +216,11 @@ struct AaModel {
       if (mode == HSTAA_PROPAGATE_INSERT && !Insert(e, p, i, val)) return false;
       if (mode == HSTAA_PROPAGATE_REMOVE) {
         Remove(e, p, i, val);
-        if (Held(e) == 0) Drop(e);
+        if (Sum(e, &MNode::held) == 0) Drop(e);
       }
     }
   }
-  std::pair<MNode *, bool> FindPrefix(MNode *node, const std::vector<std::string> &p) {
+  std::pair<MNode *, bool> FindPrefix(MNode *node, const Names &p) {
     for (const std::string &k : p) {
       MNode *child = Child(node, k);
       if (!child && !MarkOf(k).empty()) child = Child(node, MarkOf(k));
@@ -337,30 +229,114 @@ struct AaModel {
     }
     return {node, true};
   }
-};
-
-int32_t Counted(HstNode *n) { return n->subtreeValCount; }
-
-// After a refused allocation the arrays keep whatever was done before it:
-// the model takes the library's tree as it stands (its counts were checked).
-std::unique_ptr<MNode> Adopt(HstTree *t, HstNode *h) {
-  auto n = New(HST_GetVal(t, h));
-  n->key = HST_GetKey(t, h);
-  n->held = Counted(h);
-  for (int32_t i = 0; i < HST_GetNumChildren(t, h); i++) {
-    HstNode *c = HST_GetChild(t, h, i);
-    n->held -= Counted(c);
-    Attach(n.get(), Adopt(t, c), HST_GetKey(t, c));
+  // After a refused allocation the arrays keep whatever was done before it:
+  // the model takes the library's tree as it stands (its counts checked).
+  std::unique_ptr<MNode> Adopt(HstTree *t, HstNode *h) {
+    auto n = New(HST_GetVal(t, h));
+    n->held = h->subtreeValCount;
+    for (int32_t i = 0; i < HST_GetNumChildren(t, h); i++) {
+      HstNode *c = HST_GetChild(t, h, i);
+      n->held -= c->subtreeValCount;
+      Attach(n.get(), Adopt(t, c), HST_GetKey(t, c));
+    }
+    return n;
   }
-  return n;
-}
+};
 
 }  // namespace
 
+std::string RunHstModel(Ops &ops, Arena arena) {
+  static const char kSeps[] = {'/', '.', '\0'};
+  static const Names kNames = {"a", "b", "ab", "", "/", "."};
+  const char sep = kSeps[ops.Take(3)];
+  Model m{ops.Take(2) ? CofferVal{0} : CofferVal{7}};
+  OpWatch made(arena.tp);
+  HstTree *t = HST_AllocTreeEx(arena.pool, sep, m.dv, ops.Take(3), ops.Take(4) - 1);
+  if (!t) return made.Refused() ? "" : "creation failed unrefused";
+  HST_SetFreeValFn(t, Release);
+  MODEL_TRY(CompareTree(t, &m.root, false, arena.tp));
+  for (CofferVal next = 1; ops.More(); next++) {
+    g_log.clear();
+    std::vector<std::string> want;
+    std::vector<MNode *> all;
+    Collect(&m.root, &all);
+    MNode *x = all[ops.Take(all.size())], *y = all[ops.Take(all.size())];
+    OpWatch op(arena.tp);
+    const uint32_t kind = ops.Take(16);
+    Path p = MakePath(ops, sep, kNames);
+    const std::string text = (ops.Take(2) ? "/" : "x") + p.text;
+    if (kind < 4) {  // insert at a path: missing names made with the default value
+      HstNode *got = HST_Insert(t, text.c_str(), next);
+      MNode *n = &m.root;
+      for (const std::string &k : p.names) {
+        MNode *c = Child(n, k);
+        HstNode *h = HST_FindChild(t, n->lib, k.c_str());
+        if (!c && h) (c = Attach(n, New(m.dv), k))->lib = h;  // made by this call
+        if (!(n = c)) break;  // refused here: what was made stays
+      }
+      MODEL_EXPECT(!got == op.Refused() && got == LibOf(got ? n : nullptr));
+      if (got) n->val = next;
+    } else if (kind < 6) {  // find, through a path or by name
+      MODEL_EXPECT(HST_Find(t, text.c_str()) == LibOf(Lookup(&m.root, p.names)));
+      MODEL_EXPECT(HST_FindChild(t, x->lib, p.text.c_str()) == LibOf(Child(x, p.text)));
+    } else if (kind < 8 && !Child(x, p.text)) {  // a new child by name
+      HstNode *got = HST_InsertChild(t, x->lib, p.text.c_str(), next);
+      MODEL_EXPECT(!got == op.Refused());
+      if (got) Attach(x, New(next), p.text);
+    } else if (kind < 10) {  // remove a subtree; the root's empties the tree
+      HST_RemoveSubtree(t, x->lib);
+      std::swap(want, g_log);
+      m.Drop(x);
+      std::swap(want, g_log);
+    } else if (kind < 12 && x != &m.root) {  // copy x's subtree under y, maybe renamed
+      const std::string key = ops.Take(2) ? p.text : x->key;
+      g_b.refuseClone = ops.Take(3) ? -1 : static_cast<int>(ops.Take(next) % 1000);
+      if (Child(y, key)) continue;  // sibling names stay unique
+      HstNode *got = HST_CloneSubtree(t, x->lib, CloneVal, key == x->key ? nullptr : key.c_str(), y->lib);
+      std::swap(want, g_log);
+      std::unique_ptr<MNode> copy = m.Clone(x);
+      std::swap(want, g_log);
+      if (op.Refused()) {  // every value the copy made is released again, and only those
+        std::map<CofferVal, int> copies;
+        for (const std::string &e : g_log) {
+          CofferVal v = std::stoul(e.substr(1));
+          if (e[0] == 'C' && static_cast<int>(v % 1000) != g_b.refuseClone) copies[v + 1000]++;
+          if (e[0] == 'F' && v != m.dv) copies[v]--;
+        }
+        for (auto &c : copies) MODEL_EXPECT(c.second == 0);
+        MODEL_EXPECT(!got);
+        want = g_log;
+      } else {
+        MODEL_EXPECT(!got == !copy);
+        if (copy) Attach(y, std::move(copy), key);
+      }
+      g_b.refuseClone = -1;
+    } else if (kind < 13) {  // replace a value: never released
+      HST_SetVal(t, x->lib, next);
+      x->val = next;
+    } else if (kind < 14) {  // the count the arrays keep, carried up to the root
+      int32_t delta = static_cast<int32_t>(ops.Take(5)) - 2;
+      HSTAAAdjustSubtreeValCount(t, x->lib, delta);
+      for (MNode *n = x; n; n = n->parent) n->count += delta;
+    } else if (kind < 15) {  // clear: the root's value goes last
+      HST_Clear(t);
+      std::swap(want, g_log);
+      m.Drop(&m.root);
+      std::swap(want, g_log);
+    } else if (arena.tp) {
+      arena.tp->FailAt(arena.tp->calls());
+    }
+    MODEL_EXPECT(g_log == want);
+    MODEL_TRY(CompareTree(t, &m.root, false, arena.tp));
+  }
+  return FreeTree(t, &m.root);
+}
+
 std::string RunHstaaModel(Ops &ops, Arena arena) {
-  static const std::vector<std::string> kKeys = {"a", "", "#", "##", "#1", "#2", "#!", "# ", "##1", "###", "#", "##", "#1"};
-  AaModel m{ops.Take(2) ? CofferVal{0} : CofferVal{1000}};
-  g_b = Behaviour{static_cast<int>(ops.Take(6)) - 1, static_cast<int>(ops.Take(4)) - 1, static_cast<int>(ops.Take(4)) - 1};
+  static const Names kKeys = {"a", "", "#", "##", "#1", "#2", "#!", "# ", "##1", "###", "#", "##", "#1"};
+  Model m{ops.Take(2) ? CofferVal{0} : CofferVal{1000}};
+  g_b = Behaviour{static_cast<int>(ops.Take(6)) - 1, static_cast<int>(ops.Take(4)) - 1,
+                  static_cast<int>(ops.Take(4)) - 1};
   HstaaTree tree;
   std::memset(&tree, 0, sizeof tree);
   tree.hst.mp = *arena.pool;
@@ -368,9 +344,9 @@ std::string RunHstaaModel(Ops &ops, Arena arena) {
   tree.insertValFn = [](HstaaTree *, CofferVal cur, CofferVal op, CofferVal *out) { return *out == cur && Apply('I', cur, op, out); };
   tree.removeValFn = [](HstaaTree *, CofferVal cur, CofferVal op, CofferVal *out) { return *out == cur && Apply('R', cur, op, out); };
   HST_SetFreeValFn(&tree.hst, Release);
-  OpWatch made(arena.tp);
-  if (!HST_CreateTreeData(&tree.hst, '/', m.dv, ops.Take(3), 2)) return made.Refused() ? "" : "creation failed unrefused";
   HstTree *t = &tree.hst;
+  OpWatch made(arena.tp);
+  if (!HST_CreateTreeData(t, '/', m.dv, ops.Take(3), 2)) return made.Refused() ? "" : "creation failed unrefused";
   MODEL_TRY(CompareTree(t, &m.root, true, arena.tp));
   while (ops.More()) {
     g_log.clear();
@@ -398,12 +374,11 @@ std::string RunHstaaModel(Ops &ops, Arena arena) {
       if (op.Refused()) {  // (a refusal inside an element does not stop the insertion)
         coffer::CheckFault fault;
         MODEL_EXPECT(coffer::hst::HSTCheckTree(t, true, &fault));
-        m.root.kids.clear();
-        m.root = std::move(*Adopt(t, HST_GetRoot(t)));
+        auto adopted = m.Adopt(t, HST_GetRoot(t));
+        m.root.kids = std::move(adopted->kids);
+        m.root.val = adopted->val, m.root.held = adopted->held;
         for (auto &k : m.root.kids) k.second->parent = &m.root;
-        want = g_log;
-        got = nullptr;
-        mine = nullptr;
+        want = g_log, got = nullptr, mine = nullptr;
       }
     } else if (kind < 13) {
       if (relative)
@@ -415,10 +390,11 @@ std::string RunHstaaModel(Ops &ops, Arena arena) {
       std::swap(want, g_log);
     } else if (kind < 15) {
       bool complete = !ops.Take(2);
-      HstNode *got = relative ? HSTAAFindPrefix(&tree, start->lib, arg, &complete) : HSTAA_FindPrefix(&tree, abs.c_str(), &complete);
-      auto found = m.FindPrefix(start, p.names);
-      MODEL_EXPECT(got == found.first->lib && complete == found.second);
-      whole = found.second;  // else the unresolved name stays cut
+      HstNode *found = relative ? HSTAAFindPrefix(&tree, start->lib, arg, &complete)
+                                : HSTAA_FindPrefix(&tree, abs.c_str(), &complete);
+      auto reached = m.FindPrefix(start, p.names);
+      MODEL_EXPECT(found == reached.first->lib && complete == reached.second);
+      whole = reached.second;  // else the unresolved name stays cut
     } else if (arena.tp) {
       arena.tp->FailAt(arena.tp->calls());
     }
@@ -427,13 +403,8 @@ std::string RunHstaaModel(Ops &ops, Arena arena) {
     MODEL_TRY(CompareTree(t, &m.root, true, arena.tp));
     MODEL_EXPECT(got == LibOf(mine));  // the node inserted at, once wired up
   }
-  std::vector<std::string> want;
-  LogReleases(&m.root, &want);
-  g_log.clear();
-  HST_FreeTree(t);
-  MODEL_EXPECT(g_log == want);
   g_b = Behaviour{};
-  return "";
+  return FreeTree(t, &m.root);
 }
 
 }  // namespace coffer_test

@@ -1,6 +1,0 @@
-// Fuzz target: the three red-black tree families against its model, on the fuzzer's bytes.
-#include "support/driver.h"
-
-extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
-  return coffer_test::FuzzModel(coffer_test::RunRbtModel, data, size);
-}
