@@ -114,29 +114,35 @@ std::string FreeTree(HstTree *t, MNode *root) {
   return "";
 }
 
-// Path text over names that never hold the separator, now and then with a
-// separator at the end; the first character is never examined.
-struct Path {
+// The names a path's text (after its first character) walks through: cut
+// at each separator, which a NUL separator never does; a separator at the
+// very end ends the walk.
+Names Split(const std::string &text, char sep) {
+  if (text.empty() || !sep) return text.empty() ? Names{} : Names{text};
   Names names;
+  for (size_t at = 0;;) {
+    size_t cut = text.find(sep, at);
+    names.push_back(text.substr(at, cut - at));
+    if (cut == std::string::npos || cut + 1 == text.size()) return names;
+    at = cut + 1;
+  }
+}
+// Path text: names joined by the separator, or now and then any bytes.
+struct Path {
   std::string text;
+  Names names;
 };
 Path MakePath(Ops &ops, char sep, const Names &names) {
-  Path p;
-  for (uint32_t d = ops.Take(4); d; --d) {
-    std::string k = names[ops.Take(names.size())];
-    if (sep && k.find(sep) != std::string::npos) continue;
-    if (!sep && !p.names.empty()) {  // a NUL separator never cuts: one name
-      p.names[0] += k, p.text += k;
-      continue;
+  std::string text;
+  if (ops.Take(8) == 0) {
+    for (uint32_t n = ops.Take(12); n; --n) text += static_cast<char>(1 + ops.Take(255));
+  } else {
+    for (uint32_t d = ops.Take(5); d; --d) {
+      text += names[ops.Take(names.size())];
+      if (sep && ops.Take(3)) text += sep;
     }
-    p.text += (p.names.empty() ? "" : std::string(1, sep)) + k;
-    p.names.push_back(k);
   }
-  if (!sep && !p.names.empty() && p.names[0].empty()) p.names.clear();
-  // An empty last name needs a separator after it to be seen; any other may
-  // have one, which ends the walk all the same.
-  if (sep && !p.names.empty() && (p.names.back().empty() || ops.Take(5) == 0)) p.text += sep;
-  return p;
+  return {text, Split(text, sep)};
 }
 
 // The array a key is an element of: "#", "##", or "" for none.
