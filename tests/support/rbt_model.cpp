@@ -82,23 +82,19 @@ struct Pointers {
 };
 
 template <class F>
-struct Model {
-  using Key = typename F::Key;
-  struct Entry {
-    Key key;
-    CofferVal val;
-    RbtNode *node;
-  };
-  std::vector<Entry> e;
-  // Positions of the bounds of k: the first entry not before it, and the
-  // first after it.
-  size_t Lower(const Key &k) const {
-    return std::partition_point(e.begin(), e.end(), [&](const Entry &x) { return F::Compare(x.key, k) < 0; }) - e.begin();
-  }
-  size_t Upper(const Key &k) const {
-    return std::partition_point(e.begin(), e.end(), [&](const Entry &x) { return F::Compare(x.key, k) <= 0; }) - e.begin();
-  }
+struct Entry {
+  typename F::Key key;
+  CofferVal val;
+  RbtNode *node;
 };
+template <class F>
+using Model = std::vector<Entry<F>>;
+// The position of k's lower bound (the first entry not before it) or, past
+// its equal run, of its upper bound.
+template <class F>
+size_t Bound(const Model<F> &m, const typename F::Key &k, bool past) {
+  return std::partition_point(m.begin(), m.end(), [&](const Entry<F> &x) { return F::Compare(x.key, k) < past; }) - m.begin();
+}
 
 // The first node equal to k on the path from the root, found through the
 // tree's own links with the model's order.
@@ -116,9 +112,9 @@ RbtNode *FirstEqualOnPath(RbtTree *t, const typename F::Key &k) {
 
 template <class F>
 std::string Compare(RbtTree *t, const Model<F> &m, TestPool *tp) {
-  MODEL_EXPECT(F::size(t) == static_cast<int32_t>(m.e.size()));
+  MODEL_EXPECT(F::size(t) == static_cast<int32_t>(m.size()));
   RbtNode *n = F::first(t);
-  for (const auto &x : m.e) {
+  for (const auto &x : m) {
     MODEL_EXPECT(n == x.node && F::Compare(F::KeyOf(t, n), x.key) == 0 && n->val == x.val);
     if constexpr (F::kKind == coffer::kRbtStringKeys)
       MODEL_EXPECT(!tp || tp->SizeOf(coffer::RecordAt<char>(t, n->key)) == x.key.size() + 1);
@@ -126,7 +122,7 @@ std::string Compare(RbtTree *t, const Model<F> &m, TestPool *tp) {
   }
   MODEL_EXPECT(n == nullptr);
   n = F::prev(t, nullptr);
-  for (auto it = m.e.rbegin(); it != m.e.rend(); ++it, n = F::prev(t, n)) MODEL_EXPECT(n == it->node);
+  for (auto it = m.rbegin(); it != m.rend(); ++it, n = F::prev(t, n)) MODEL_EXPECT(n == it->node);
   MODEL_EXPECT(n == nullptr);
   coffer::CheckFault fault;
   MODEL_EXPECT(coffer::RBTCheckTree(t, F::kKind, &fault));
@@ -150,7 +146,7 @@ std::string Run(Ops &ops, Arena arena) {
     Releases().clear();
     std::vector<CofferVal> dropped;
     OpWatch op(arena.tp);
-    const size_t n = m.e.size();
+    const size_t n = m.size();
     const uint32_t kind = ops.Take(16);
     Key k = F::Make(ops, range);
     if (kind < 6) {  // insert, now and then into a caller's node
@@ -160,27 +156,29 @@ std::string Run(Ops &ops, Arena arena) {
       MODEL_EXPECT(!got == op.Refused() && (!mine || got == mine || !std::memcmp(mine, &before, sizeof before)));
       if (got) {
         MODEL_EXPECT(got->ownsNode == !mine && (mine || !arena.tp || arena.tp->SizeOf(got) == sizeof(RbtNode)));
-        m.e.insert(m.e.begin() + m.Upper(k), {k, next, got});
+        // Into a caller's node only the string family allocates: its key.
+        MODEL_EXPECT(!mine || !arena.tp || arena.tp->calls() - op.start == (F::kKind == coffer::kRbtStringKeys));
+        m.insert(m.begin() + Bound(m, k, true), {k, next, got});
         spareUsed += mine != nullptr;
       }
     } else if (kind < 9 && n) {  // remove one node
       size_t i = ops.Take(n);
-      dropped.push_back(m.e[i].val);
-      F::remove(t, m.e[i].node);
-      m.e.erase(m.e.begin() + i);
+      dropped.push_back(m[i].val);
+      F::remove(t, m[i].node);
+      m.erase(m.begin() + i);
     } else if (kind < 11 && n) {  // remove between two positions (to the end: null)
       size_t i = ops.Take(n), j = std::min(n, i + ops.Take(6));
-      for (size_t x = i; x < j; x++) dropped.push_back(m.e[x].val);
-      F::removeRange(t, m.e[i].node, j < n ? m.e[j].node : nullptr);  // i == j: first == end
-      m.e.erase(m.e.begin() + i, m.e.begin() + j);
+      for (size_t x = i; x < j; x++) dropped.push_back(m[x].val);
+      F::removeRange(t, m[i].node, j < n ? m[j].node : nullptr);  // i == j: first == end
+      m.erase(m.begin() + i, m.begin() + j);
     } else if (kind < 12) {  // remove the run of keys equal to k, delimited by the bounds
-      size_t i = m.Lower(k), j = m.Upper(k);
+      size_t i = Bound(m, k, false), j = Bound(m, k, true);
       RbtNode *lo = F::lowerBound(t, F::Pass(k)), *hi = F::upperBound(t, F::Pass(k));
-      MODEL_EXPECT(lo == (i < n ? m.e[i].node : nullptr) && hi == (j < n ? m.e[j].node : nullptr));
+      MODEL_EXPECT(lo == (i < n ? m[i].node : nullptr) && hi == (j < n ? m[j].node : nullptr));
       MODEL_EXPECT(F::find(t, F::Pass(k)) == FirstEqualOnPath<F>(t, k));
-      for (size_t x = i; x < j; x++) dropped.push_back(m.e[x].val);
+      for (size_t x = i; x < j; x++) dropped.push_back(m[x].val);
       if (lo) F::removeRange(t, lo, hi);
-      m.e.erase(m.e.begin() + i, m.e.begin() + j);
+      m.erase(m.begin() + i, m.begin() + j);
     } else if (kind < 14) {  // swap the whole content into an empty tree and back
       RbtTree *other = F::allocEx(arena.pool);
       if (!other) MODEL_EXPECT(op.Refused());
@@ -192,9 +190,9 @@ std::string Run(Ops &ops, Arena arena) {
       F::freeTree(other);
     } else if (kind == 14) {
       dropped.clear();
-      for (const auto &x : m.e) dropped.push_back(x.val);
+      for (const auto &x : m) dropped.push_back(x.val);
       F::clear(t);
-      m.e.clear();
+      m.clear();
     } else if (arena.tp) {
       arena.tp->FailAt(arena.tp->calls());
     }
@@ -204,7 +202,7 @@ std::string Run(Ops &ops, Arena arena) {
   Releases().clear();
   F::freeTree(t);
   std::vector<CofferVal> rest;
-  for (const auto &x : m.e) rest.push_back(x.val);
+  for (const auto &x : m) rest.push_back(x.val);
   MODEL_EXPECT(ReleasedVals() == rest && nil.key == 0xC0FFEE);
   return "";
 }
