@@ -28,12 +28,16 @@ TEST(Rbt, PoolCallsAndReleasesInOrder) {
   RbtInt32_Insert(i, 5, 5);
   RbtInt32_Clear(i);
   RbtInt32_FreeTree(i);
+  RbtTree h = {*tp.pool(), nullptr, nullptr, false, nullptr};  // a caller's handle
+  EXPECT_EQ(RbtVoidPtr_CreateTreeData(&h, nullptr), 1);
+  RbtVoidPtr_FreeTree(&h);  // not owned: the handle stays
   RBT_FreeTree(nullptr);
   RbtInt32_FreeTree(nullptr);
   RbtVoidPtr_FreeTree(nullptr);
   EXPECT_EQ(TakeCallLog(),
             "c1x40 c1x16 c1x24 a2 c1x24 a2 v2 f v1 f f f f f "  // the caller's node stays
-            "c1x40 c1x16 c1x24 c1x24 v4 f v5 f f f");
+            "c1x40 c1x16 c1x24 c1x24 v4 f v5 f f f "
+            "c1x16 c1x24 f f");  // data and sentinel of the caller's handle
   EXPECT_EQ(tp.held(), 0u);
 }
 

@@ -133,8 +133,9 @@ template <class F>
 std::string Run(Ops &ops, Arena arena) {
   using Key = typename F::Key;
   const uint32_t range = ops.Take(2);
-  RbtNode nil{}, spare[16];
-  nil.key = 0xC0FFEE;  // a caller's sentinel keeps its key
+  RbtNode nil, spare[16];
+  std::memset(&nil, 0xA5, sizeof nil);  // the tree sets every field of a caller's sentinel,
+  nil.key = 0xC0FFEE;                   // but its key, which it keeps
   const bool callerNil = ops.Take(2);
   OpWatch made(arena.tp);
   RbtTree *t = callerNil ? F::allocWithNil(arena.pool, &nil) : F::allocEx(arena.pool);
