@@ -1,10 +1,20 @@
 // The region heap: a first-two-fit allocator whose bookkeeping lives entirely
 // inside a caller-supplied region and links blocks by region offset, so one
 // region can be mapped at different addresses by several processes.
+//
+// Other processes write the region too, so every header word is checked
+// before it is used, and each call reads and checks all it will touch before
+// its first write. A call that finds a bad word refuses and writes nothing.
+// The checks are those of a well-formed region, so on one the calls make
+// exactly the writes they always made, in the same order.
 #include "mempool/region_heap.h"
 
 #include <cstddef>
 #include <cstring>
+
+#ifdef COFFER_CHECKS
+#include <coffer/platform.h>
+#endif
 
 static_assert(sizeof(ShRegionHeader) == 16, "region header is 16 bytes");
 static_assert(offsetof(ShRegionHeader, regionSize) == 0 &&
@@ -18,6 +28,15 @@ static_assert(offsetof(ShBlockHeader, blockSize) == 0 &&
               "block header layout");
 static_assert(sizeof(size_t) == sizeof(uint32_t), "region sizes are 32-bit");
 
+// The kill test stops a process after any header write; other builds have
+// no such point.
+#ifdef COFFER_HEAP_KILL_POINTS
+extern "C" void CofferHeapKillPoint(void);
+#define COFFER_KILL_POINT() CofferHeapKillPoint()
+#else
+#define COFFER_KILL_POINT() ((void)0)
+#endif
+
 namespace coffer {
 namespace {
 
@@ -27,76 +46,357 @@ constexpr uint32_t kHead = sizeof(ShBlockHeader);
 // A region must be larger than its header plus one block with no room.
 constexpr uint32_t kMinRegion = sizeof(ShRegionHeader) + kHead;
 constexpr uint32_t kLargestRoundable = 0xFFFFFFFCu;
+constexpr uint32_t kNone = SH_NO_BLOCK;
 
-// The only places where region offsets and addresses meet.
-ShRegionHeader *Header(void *region) { return static_cast<ShRegionHeader *>(region); }
-ShBlockHeader *BlockAt(void *region, uint32_t off) {
-  return reinterpret_cast<ShBlockHeader *>(static_cast<char *>(region) + off);
+// One call's view of a region: its size is read once and checked, and every
+// offset read from the region is measured against it before it is followed.
+struct Heap {
+  char *base;
+  uint32_t size;
+  ShOutcome *out;
+  // While set, every write is noted here so that it can be undone: a
+  // resize whose allocation turns out to have met damage (only a damaged
+  // region can do that) takes it back and writes nothing. An allocation
+  // writes at most 12 words.
+  struct Journal {
+    uint32_t *word[12], old[12];
+    int n;
+  } *journal;
+
+  // Every header write goes through here, so the kill test can stop a call
+  // between any two of them.
+  void Put(uint32_t &word, uint32_t value) const {
+    if (journal) journal->word[journal->n] = &word, journal->old[journal->n++] = word;
+    word = value;
+    COFFER_KILL_POINT();
+  }
+  void Undo() const {
+    while (journal->n > 0) --journal->n, *journal->word[journal->n] = journal->old[journal->n];
+  }
+
+  ShRegionHeader *head() const { return reinterpret_cast<ShRegionHeader *>(base); }
+  ShBlockHeader *at(uint32_t off) const { return reinterpret_cast<ShBlockHeader *>(base + off); }
+
+  // Record a refusal; false, so that checks can end in `return Damaged(...)`.
+  bool Refuse(ShRefusal why, uint32_t off) const {
+    *out = {why, off};
+    return false;
+  }
+  bool Damaged(uint32_t off) const { return Refuse(ShRefusal::kDamaged, off); }
+
+  // A block header fits at off: past the region header, aligned, inside.
+  // (The walks test every link, so the ranges are one unsigned comparison.)
+  bool Fits(uint32_t off) const { return off - kHead <= size - 2 * kHead && off % 4 == 0; }
+  // A size the block at off (which fits) may have: at least a header, ending
+  // inside the region, and a multiple of 4 unless the block is the last, so
+  // that every successor is aligned.
+  bool SizeFits(uint32_t off, uint32_t bs) const {
+    return bs - kHead <= size - off - kHead && (bs % 4 == 0 || bs == size - off);
+  }
+  // The block at off (whose size fits) is not the last.
+  bool HasSuccessor(uint32_t off) const { return at(off)->blockSize < size - off; }
+};
+
+// A free block's links are SH_NO_BLOCK or offsets of at least 16, never 0;
+// an allocated block's are both 0. One 0 link is torn.
+enum class Use { kAllocated, kFree, kTorn };
+Use UseOf(const ShBlockHeader *b) {
+  if (b->nextFree == 0 && b->prevFree == 0) return Use::kAllocated;
+  return b->nextFree != 0 && b->prevFree != 0 ? Use::kFree : Use::kTorn;
 }
-uint32_t BlockOfPayload(void *region, void *payload) {
-  return static_cast<uint32_t>(static_cast<char *>(payload) - static_cast<char *>(region)) - kHead;
-}
-void *PayloadOf(void *region, uint32_t off) { return static_cast<char *>(region) + off + kHead; }
 
-// Links are never both 0 on a free block: they hold SH_NO_BLOCK or offsets
-// of at least 16.
-bool IsFree(const ShBlockHeader *b) { return b->nextFree != 0 || b->prevFree != 0; }
-
-bool HasSuccessor(void *region, uint32_t off) {
-  return off + BlockAt(region, off)->blockSize < Header(region)->regionSize;
+bool Open(Heap *h, void *region, ShOutcome *out) {
+  *out = {ShRefusal::kNone, 0};
+  *h = {static_cast<char *>(region), static_cast<ShRegionHeader *>(region)->regionSize, out,
+        nullptr};
+  return h->size > kMinRegion || h->Damaged(0);
 }
 
-void Unlink(void *region, uint32_t off) {
-  ShBlockHeader *b = BlockAt(region, off);
-  if (b->prevFree == SH_NO_BLOCK)
-    Header(region)->freeHead = b->nextFree;
-  else
-    BlockAt(region, b->prevFree)->nextFree = b->nextFree;
-  if (b->nextFree != SH_NO_BLOCK) BlockAt(region, b->nextFree)->prevFree = b->prevFree;
+// ---- checks: read only ---------------------------------------------------------
+
+// The block a free-list link leads to from `from` (kNone: from freeHead): a
+// free block whose size fits and whose prevFree names `from`. A link that
+// names no header in the region, or an allocated block, is the fault of the
+// header holding it; anything else is the fault of the block it names.
+bool ListStep(const Heap &h, uint32_t from, uint32_t off) {
+  uint32_t holder = from == kNone ? 0 : from;
+  if (!h.Fits(off)) return h.Damaged(holder);
+  const ShBlockHeader *b = h.at(off);
+  if (b->prevFree == from && b->nextFree != 0 && h.SizeFits(off, b->blockSize)) return true;
+  return h.Damaged(UseOf(b) == Use::kAllocated ? holder : off);
+}
+
+// The free block at off can be unlinked: both its list neighbours (or
+// freeHead) name it back.
+bool Unlinkable(const Heap &h, uint32_t off) {
+  const ShBlockHeader *b = h.at(off);
+  bool prevOk = b->prevFree == kNone ? h.head()->freeHead == off
+                                     : h.Fits(b->prevFree) && h.at(b->prevFree)->nextFree == off &&
+                                           UseOf(h.at(b->prevFree)) == Use::kFree;
+  bool nextOk =
+      b->nextFree == kNone || (h.Fits(b->nextFree) && h.at(b->nextFree)->prevFree == off &&
+                               UseOf(h.at(b->nextFree)) == Use::kFree);
+  return (prevOk && nextOk) || h.Damaged(off);
 }
 
 // Walks the free list and stops at the second block that can hold r bytes;
 // of the (at most) two, the lower one wins, which keeps the heap compact
-// without the cost of a full best-fit scan.
-uint32_t FindFit(void *region, uint32_t r) {
-  uint32_t chosen = SH_NO_BLOCK;
-  for (uint32_t o = Header(region)->freeHead; o != SH_NO_BLOCK; o = BlockAt(region, o)->nextFree) {
-    if (r > BlockAt(region, o)->blockSize - kHead) continue;
-    if (chosen == SH_NO_BLOCK) {
-      chosen = o;
+// without the cost of a full best-fit scan. This is the hot loop, so each
+// step checks only what it reads: the link (a header in the region), the
+// back link and the range of the size; a torn block's 0 link fails the next
+// step, and the caller checks the rest of the block it takes. No sound list
+// is longer than the blocks the region can hold, so a longer walk has met
+// overlapping headers.
+bool FindFit(const Heap &h, uint32_t r, uint32_t *chosen) {
+  *chosen = kNone;
+  const uint32_t size = h.size, most = size / kHead;
+  uint32_t from = kNone, steps = 0;
+  for (uint32_t o = h.head()->freeHead; o != kNone; from = o, o = h.at(o)->nextFree) {
+    uint32_t holder = from == kNone ? 0 : from;
+    if (!h.Fits(o)) return h.Damaged(holder);
+    const ShBlockHeader *b = h.at(o);
+    uint32_t room = b->blockSize - kHead;
+    if (b->prevFree != from || room > size - o - kHead || ++steps > most)
+      return h.Damaged(UseOf(b) == Use::kAllocated ? holder : o);
+    if (r > room) continue;
+    if (*chosen == kNone) {
+      *chosen = o;
     } else {
-      if (o < chosen) chosen = o;
+      if (o < *chosen) *chosen = o;
       break;
     }
   }
-  return chosen;
+  return true;
 }
 
-// Cuts need bytes off the front of the free block at off. The remainder
-// takes the block's place on the free list (the caller unlinks the front).
-void Split(void *region, uint32_t off, uint32_t need) {
-  ShBlockHeader *b = BlockAt(region, off);
-  uint32_t restOff = off + need;
-  ShBlockHeader *rest = BlockAt(region, restOff);
-  rest->blockSize = b->blockSize - need;
-  rest->prevBlockSize = need;
-  rest->nextFree = b->nextFree;
-  rest->prevFree = off;
-  if (b->nextFree != SH_NO_BLOCK) BlockAt(region, b->nextFree)->prevFree = restOff;
-  if (HasSuccessor(region, restOff))
-    BlockAt(region, restOff + rest->blockSize)->prevBlockSize = rest->blockSize;
-  b->blockSize = need;
-  b->nextFree = restOff;
+// The block after off (whose size fits), if any, is a header in the region
+// whose prevBlockSize agrees.
+bool SuccessorAgrees(const Heap &h, uint32_t off) {
+  uint32_t size = h.at(off)->blockSize, next = off + size;
+  if (next == h.size) return true;
+  if (!h.Fits(next)) return h.Damaged(off);
+  return h.at(next)->prevBlockSize == size || h.Damaged(next);
 }
+
+// ptr is the payload of an allocated block of this region whose size fits.
+bool Owned(const Heap &h, void *ptr, uint32_t *off) {
+  uint32_t payload =
+      static_cast<uint32_t>(reinterpret_cast<uintptr_t>(ptr) - reinterpret_cast<uintptr_t>(h.base));
+  *off = payload - kHead;
+  if (!h.Fits(*off)) return h.Refuse(ShRefusal::kNotAllocated, payload);
+  const ShBlockHeader *b = h.at(*off);
+  Use use = UseOf(b);
+  if (use == Use::kFree) return h.Refuse(ShRefusal::kNotAllocated, payload);  // a second free
+  return (use == Use::kAllocated && h.SizeFits(*off, b->blockSize)) || h.Damaged(*off);
+}
+
+// What releasing the block at off will join: the free blocks right after it
+// (`after`) and right before it (`before`). Each is checked as a whole block
+// on the list, and so are the block after them (whose prevBlockSize the
+// release rewrites) and the list head (whose prevFree it rewrites). More than
+// one free neighbour on a side is untidiness left by a release cut short.
+struct Release {
+  uint32_t off, after, before;
+};
+
+bool CheckAfter(const Heap &h, Release *rel) {
+  uint32_t last = rel->off;
+  for (uint32_t next; (next = last + h.at(last)->blockSize) != h.size; last = next) {
+    if (!h.Fits(next)) return h.Damaged(last);
+    const ShBlockHeader *b = h.at(next);
+    if (b->prevBlockSize != h.at(last)->blockSize) return h.Damaged(next);
+    Use use = UseOf(b);
+    if (use == Use::kAllocated) break;
+    if (use == Use::kTorn || !h.SizeFits(next, b->blockSize)) return h.Damaged(next);
+    if (!Unlinkable(h, next)) return false;
+    ++rel->after;  // offsets only grow, so this ends
+  }
+  return true;
+}
+
+bool CheckBefore(const Heap &h, Release *rel) {
+  for (uint32_t cur = rel->off;; ++rel->before) {
+    uint32_t pbs = h.at(cur)->prevBlockSize;
+    if (pbs == 0) return cur == kHead || h.Damaged(cur);
+    if (pbs < kHead || pbs % 4 != 0 || pbs > cur - kHead || h.at(cur - pbs)->blockSize != pbs)
+      return h.Damaged(cur);
+    cur -= pbs;
+    Use use = UseOf(h.at(cur));
+    if (use == Use::kAllocated) return true;
+    if (use == Use::kTorn) return h.Damaged(cur);
+    if (!Unlinkable(h, cur)) return false;  // offsets only shrink, so this ends
+  }
+}
+
+bool CheckRelease(const Heap &h, Release *rel) {
+  rel->after = rel->before = 0;
+  if (!CheckAfter(h, rel) || !CheckBefore(h, rel)) return false;
+  uint32_t first = h.head()->freeHead;
+  return first == kNone || ListStep(h, kNone, first);
+}
+
+// ---- writes: only after the checks above ---------------------------------------
+
+void Unlink(const Heap &h, uint32_t off) {
+  ShBlockHeader *b = h.at(off);
+  if (b->prevFree == kNone)
+    h.Put(h.head()->freeHead, b->nextFree);
+  else
+    h.Put(h.at(b->prevFree)->nextFree, b->nextFree);
+  if (b->nextFree != kNone) h.Put(h.at(b->nextFree)->prevFree, b->prevFree);
+}
+
+// Absorbs the free block at absorbed into the free block at keeper, which
+// lies immediately before it. The absorbed header is left as it was: it is
+// payload now.
+void Merge(const Heap &h, uint32_t keeper, uint32_t absorbed) {
+  Unlink(h, absorbed);
+  ShBlockHeader *k = h.at(keeper);
+  h.Put(k->blockSize, k->blockSize + h.at(absorbed)->blockSize);
+  if (h.HasSuccessor(keeper)) h.Put(h.at(keeper + k->blockSize)->prevBlockSize, k->blockSize);
+}
+
+// Cuts need bytes off the front of the free block at off. The remainder is
+// written whole before anything names it, and takes the block's place on the
+// free list (the caller unlinks the front).
+void Split(const Heap &h, uint32_t off, uint32_t need) {
+  ShBlockHeader *b = h.at(off);
+  uint32_t restOff = off + need;
+  ShBlockHeader *rest = h.at(restOff);
+  h.Put(rest->blockSize, b->blockSize - need);
+  h.Put(rest->prevBlockSize, need);
+  h.Put(rest->nextFree, b->nextFree);
+  h.Put(rest->prevFree, off);
+  if (b->nextFree != kNone) h.Put(h.at(b->nextFree)->prevFree, restOff);
+  if (h.HasSuccessor(restOff)) h.Put(h.at(restOff + rest->blockSize)->prevBlockSize, rest->blockSize);
+  h.Put(b->blockSize, need);
+  h.Put(b->nextFree, restOff);
+}
+
+// The block goes to the front of the free list, then joins the free blocks
+// after it and is joined by those before it, the first of which keeps its
+// place on the list.
+void ApplyRelease(const Heap &h, const Release &rel) {
+  ShBlockHeader *b = h.at(rel.off);
+  uint32_t oldHead = h.head()->freeHead;
+  h.Put(b->prevFree, kNone);
+  h.Put(b->nextFree, oldHead);
+  if (oldHead != kNone) h.Put(h.at(oldHead)->prevFree, rel.off);
+  h.Put(h.head()->freeHead, rel.off);
+  for (uint32_t i = 0; i < rel.after; ++i) Merge(h, rel.off, rel.off + b->blockSize);
+  for (uint32_t i = 0, cur = rel.off; i < rel.before; ++i) {
+    uint32_t prev = cur - h.at(cur)->prevBlockSize;
+    Merge(h, prev, cur);
+    cur = prev;
+  }
+}
+
+// ---- the calls -------------------------------------------------------------------
+
+void *Alloc(const Heap &h, size_t size) {
+  // Rounding the three largest sizes up would wrap to 0.
+  if (size > kLargestRoundable) return nullptr;
+  uint32_t r = (static_cast<uint32_t>(size) + 3u) & ~3u;
+  uint32_t off;
+  if (h.head()->freeHead == kNone || !FindFit(h, r, &off) || off == kNone) return nullptr;
+  // A remainder of 16 bytes or less would be a block with no room, so the
+  // whole block goes out instead. The fit leaves need <= blockSize.
+  ShBlockHeader *b = h.at(off);
+  uint32_t need = r + kHead;
+  bool split = need < b->blockSize - kHead;
+  if (b->nextFree == 0 || !h.SizeFits(off, b->blockSize)) return h.Damaged(off), nullptr;
+  if (b->nextFree != kNone && !ListStep(h, off, b->nextFree)) return nullptr;
+  if (split && !SuccessorAgrees(h, off)) return nullptr;
+  if (split) Split(h, off, need);
+  Unlink(h, off);
+  h.Put(b->nextFree, 0);
+  h.Put(b->prevFree, 0);
+  return h.base + off + kHead;
+}
+
+bool Free(const Heap &h, void *ptr) {
+  Release rel;
+  if (!Owned(h, ptr, &rel.off) || !CheckRelease(h, &rel)) return false;
+  ApplyRelease(h, rel);
+  return true;
+}
+
+// Never in place: the new block is taken while the old one is held, so
+// they never overlap. The release is checked before the allocation, so that
+// a refusal leaves the region as it was, and again after it; on a sound
+// region the allocation writes only checked words and the second check
+// passes, while on a damaged one it may not, and the allocation is undone.
+// The copy comes last: a release writes headers only, never the payload.
+void *Realloc(const Heap &h, void *ptr, size_t size, bool *changed) {
+  *changed = false;
+  if (!ptr) {
+    void *p = Alloc(h, size);
+    *changed = p != nullptr;
+    return p;
+  }
+  Release rel;
+  if (!Owned(h, ptr, &rel.off) || !CheckRelease(h, &rel)) return nullptr;
+  if (size == 0) {
+    ApplyRelease(h, rel);
+    *changed = true;
+    return nullptr;
+  }
+  uint32_t capacity = h.at(rel.off)->blockSize - kHead;
+  if (capacity == size) return ptr;
+  Heap::Journal journal;
+  journal.n = 0;
+  Heap logged = h;
+  logged.journal = &journal;
+  void *q = Alloc(logged, size);
+  if (!q) return nullptr;
+  if (!CheckRelease(h, &rel)) return logged.Undo(), nullptr;
+  ApplyRelease(h, rel);
+  std::memmove(q, ptr, capacity < size ? capacity : size);
+  *changed = true;
+  return q;
+}
+
+#ifdef COFFER_CHECKS
+// A checking build checks the whole region after every call that changed
+// it and stops at once when the region is damaged. Only calls that went
+// through are checked: a refused call wrote nothing. A call that went
+// through on a region damaged where it did not look stops here too, so the
+// tests that expect such calls to go on (the kill test, the fuzz targets)
+// build the heap without this check.
+void CheckAfterCall(const Heap &h, const char *call) {
+  ShFault fault;
+  uint32_t at;
+  if (SHFirstDamage(h.base, h.size, &fault, &at))
+    Panic("Region heap check after %s: %s at offset %u.", call, SHFaultText(fault),
+          static_cast<unsigned>(at));
+}
+#else
+inline void CheckAfterCall(const Heap &, const char *) {}
+#endif
 
 }  // namespace
 
-void SHMergeBlocks(void *region, uint32_t keeper, uint32_t absorbed) {
-  Unlink(region, absorbed);
-  ShBlockHeader *k = BlockAt(region, keeper);
-  k->blockSize += BlockAt(region, absorbed)->blockSize;
-  if (HasSuccessor(region, keeper))
-    BlockAt(region, keeper + k->blockSize)->prevBlockSize = k->blockSize;
+void *SHAllocChecked(void *region, size_t size, ShOutcome *out) {
+  Heap h;
+  if (!Open(&h, region, out)) return nullptr;
+  void *p = Alloc(h, size);
+  if (p) CheckAfterCall(h, "SH_Alloc");
+  return p;
+}
+
+void SHFreeChecked(void *region, void *ptr, ShOutcome *out) {
+  Heap h;
+  if (!Open(&h, region, out) || !ptr) return;
+  if (Free(h, ptr)) CheckAfterCall(h, "SH_Free");
+}
+
+void *SHReallocChecked(void *region, void *ptr, size_t size, ShOutcome *out) {
+  Heap h;
+  if (!Open(&h, region, out)) return nullptr;
+  bool changed;
+  void *p = Realloc(h, ptr, size, &changed);
+  if (changed && out->refusal == ShRefusal::kNone) CheckAfterCall(h, "SH_Realloc");
+  return p;
 }
 
 }  // namespace coffer
@@ -105,10 +405,10 @@ using namespace coffer;
 
 extern "C" COFFER_API int32_t SH_Reset(void *region, size_t size) {
   if (size <= kMinRegion) return -1;
-  ShRegionHeader *h = Header(region);
+  ShRegionHeader *h = static_cast<ShRegionHeader *>(region);
   h->regionSize = size;
   h->freeHead = kHead;
-  ShBlockHeader *b = BlockAt(region, kHead);
+  ShBlockHeader *b = reinterpret_cast<ShBlockHeader *>(static_cast<char *>(region) + kHead);
   b->blockSize = size - kHead;
   b->prevBlockSize = 0;
   b->nextFree = SH_NO_BLOCK;
@@ -117,55 +417,16 @@ extern "C" COFFER_API int32_t SH_Reset(void *region, size_t size) {
 }
 
 extern "C" COFFER_API void *SH_Alloc(void *region, size_t size) {
-  // Rounding the three largest sizes up would wrap to 0.
-  if (size > kLargestRoundable) return nullptr;
-  uint32_t r = (static_cast<uint32_t>(size) + 3u) & ~3u;
-  if (Header(region)->freeHead == SH_NO_BLOCK) return nullptr;
-  uint32_t off = FindFit(region, r);
-  if (off == SH_NO_BLOCK) return nullptr;
-  // A remainder of 16 bytes or less would be a block with no room, so the
-  // whole block goes out instead.
-  uint32_t need = r + kHead;
-  ShBlockHeader *b = BlockAt(region, off);
-  if (need < b->blockSize - kHead) Split(region, off, need);
-  Unlink(region, off);
-  b->nextFree = 0;
-  b->prevFree = 0;
-  return PayloadOf(region, off);
+  ShOutcome out;
+  return SHAllocChecked(region, size, &out);
 }
 
 extern "C" COFFER_API void SH_Free(void *region, void *ptr) {
-  if (!ptr) return;
-  uint32_t off = BlockOfPayload(region, ptr);
-  ShRegionHeader *h = Header(region);
-  ShBlockHeader *b = BlockAt(region, off);
-  b->prevFree = SH_NO_BLOCK;
-  b->nextFree = h->freeHead;
-  if (h->freeHead != SH_NO_BLOCK) BlockAt(region, h->freeHead)->prevFree = off;
-  h->freeHead = off;
-  if (HasSuccessor(region, off)) {
-    uint32_t next = off + b->blockSize;
-    if (IsFree(BlockAt(region, next))) SHMergeBlocks(region, off, next);
-  }
-  if (b->prevBlockSize != 0) {
-    uint32_t prev = off - b->prevBlockSize;
-    if (IsFree(BlockAt(region, prev))) SHMergeBlocks(region, prev, off);
-  }
+  ShOutcome out;
+  SHFreeChecked(region, ptr, &out);
 }
 
 extern "C" COFFER_API void *SH_Realloc(void *region, void *ptr, size_t size) {
-  if (!ptr) return SH_Alloc(region, size);
-  if (size == 0) {
-    SH_Free(region, ptr);
-    return nullptr;
-  }
-  uint32_t capacity = BlockAt(region, BlockOfPayload(region, ptr))->blockSize - kHead;
-  if (capacity == size) return ptr;
-  // Never in place: the new block is taken while the old one is held, so
-  // the copy below never overlaps.
-  void *q = SH_Alloc(region, size);
-  if (!q) return nullptr;
-  std::memcpy(q, ptr, capacity < size ? capacity : size);
-  SH_Free(region, ptr);
-  return q;
+  ShOutcome out;
+  return SHReallocChecked(region, ptr, size, &out);
 }

@@ -1,33 +1,121 @@
-// Internal operations of the region heap, for the pools and for tests.
+// Internal operations of the region heap, for the pools, the checker and tests.
 #ifndef COFFER_MEMPOOL_REGION_HEAP_H
 #define COFFER_MEMPOOL_REGION_HEAP_H
 
 #include <coffer/mempool.h>
 
 #include <cstdint>
-#include <string>
+#include <cstdio>
 
 namespace coffer {
 
-// Absorbs the free block at region offset absorbed into the free block at
-// keeper, which lies immediately before it.
-void SHMergeBlocks(void *region, uint32_t keeper, uint32_t absorbed);
+// ---- checked heap calls ----------------------------------------------------
+// A region is memory that other processes write too, so the heap checks every
+// header word it reads before it uses it. A call that meets a word that fails
+// its check refuses and writes nothing: allocation and resizing return null,
+// a release leaves the region as it was. The exported SH_* calls are these
+// with the outcome dropped; the pools keep it to report why they failed.
 
-// What a heap check found, filled whether or not the heap is sound.
+enum class ShRefusal : uint32_t {
+  kNone,          // done, or out of room
+  kDamaged,       // a header failed its check; at is its offset (0: region header)
+  kNotAllocated,  // ptr is not the payload of an allocated block; at is ptr's offset
+};
+// The heap cannot tell a damaged header of a block handed back from an
+// address that was never a payload: a release or resize refused as damaged
+// may be either, and only a check of the whole region tells which.
+
+struct ShOutcome {
+  ShRefusal refusal;
+  uint32_t at;
+};
+
+void *SHAllocChecked(void *region, size_t size, ShOutcome *out);
+void *SHReallocChecked(void *region, void *ptr, size_t size, ShOutcome *out);
+void SHFreeChecked(void *region, void *ptr, ShOutcome *out);
+
+// ---- the heap checker --------------------------------------------------------
+// Walks a region of any content, reading only inside the first mappedSize
+// bytes, never looping, and reports every fault it finds with the offset of
+// the header that holds it (0 for the region header).
+
+enum class ShFault : uint8_t {
+  // Untidy, not damage: a release cut short leaves free neighbours, which the
+  // heap uses safely and merges when it next touches them.
+  kAdjacentFree,
+  // Damage: each would lead a walk astray.
+  kRegionTooSmall,       // regionSize (or the mapping) leaves no room for a block
+  kRegionBeyondMapping,  // regionSize is larger than the mapping
+  kBlockTruncated,       // a block would start too close to the end for its header
+  kBlockTooSmall,        // blockSize is less than a header
+  kBlockPastEnd,         // the block runs past the region's end
+  kBlockMisaligned,      // an inner blockSize that is not a multiple of 4
+  kPrevSizeMismatch,     // prevBlockSize disagrees with the block before
+  kHalfFree,             // one free-list link is 0 and the other is not
+  kLinkNotBlock,         // a free-list link (freeHead at 0) names no block
+  kLinkToAllocated,      // a free-list link names an allocated block
+  kBackLink,             // prevFree does not name the block before on the free list
+  kListCycle,            // the free list comes back to a block it visited
+  kFreeUnlisted,         // a free block the free list never reaches
+};
+constexpr int kShFaultKinds = 14;
+
+enum class ShHeapState { kSound, kUntidy, kDamaged, kNoMemory };
+
+// What the checker counted on its walk, for statistics as much as for tests.
+// Blocks past a tiling fault are not counted.
 struct ShHeapCounts {
   uint32_t freeBlocks;
   uint32_t allocatedBlocks;
   uint32_t freeBytes;       // sum of free blockSize, headers included
   uint32_t allocatedBytes;  // sum of allocated blockSize, headers included
+  uint32_t largestFree;     // largest free blockSize
+  uint32_t freeListLength;  // blocks the free list reaches
+  uint32_t sizeLog2[32];    // blocks by the highest set bit of blockSize
 };
 
-// Walks a formatted region and verifies every invariant of the heap: the
-// blocks tile the region exactly, each prevBlockSize matches, no two free
-// blocks are adjacent, allocated blocks have both links 0, and the free list
-// is doubly linked and holds exactly the free blocks. Returns false and says
-// why (when why is not null) at the first fault. Allocates from the process
-// heap, so it is meant for tests and diagnostics, never for the allocator.
-bool SHCheckHeap(const void *region, ShHeapCounts *counts, std::string *why);
+// Called once per fault, in the order they are found.
+typedef void (*ShFaultSink)(void *context, ShFault fault, uint32_t at);
+
+// Checks the region at `region`, of which mappedSize bytes are readable;
+// counts (when not null) gets the statistics. kNoMemory: the checker could
+// not get its bitmaps (one bit per 4 bytes of region, twice) and checked
+// nothing. Allocates with malloc and uses no C++ runtime, so the library and
+// tools can run it anywhere.
+ShHeapState SHCheckRegion(const void *region, size_t mappedSize, ShHeapCounts *counts,
+                          ShFaultSink sink, void *context);
+
+// True when the region is damaged; *fault and *at then tell the first damage.
+bool SHFirstDamage(const void *region, size_t mappedSize, ShFault *fault, uint32_t *at);
+
+const char *SHFaultText(ShFault fault);
+inline bool SHFaultIsDamage(ShFault fault) { return fault != ShFault::kAdjacentFree; }
+
+// One-line form for tests: true when the region, mapped exactly as large as
+// its header says, is sound and tidy; otherwise *why (any string type) tells
+// the first fault.
+template <class Text>
+bool SHCheckHeap(const void *region, ShHeapCounts *counts, Text *why) {
+  struct First {
+    ShFault fault;
+    uint32_t at;
+    int seen;
+  } first = {ShFault::kAdjacentFree, 0, 0};
+  auto keep = [](void *c, ShFault f, uint32_t at) {
+    auto *p = static_cast<First *>(c);
+    if (!p->seen++) p->fault = f, p->at = at;
+  };
+  ShHeapState state = SHCheckRegion(region, static_cast<const ShRegionHeader *>(region)->regionSize,
+                                    counts, keep, &first);
+  if (state != ShHeapState::kSound && why) {
+    char text[128];
+    std::snprintf(text, sizeof text, "%s (block at %u)",
+                  first.seen ? SHFaultText(first.fault) : "checker out of memory",
+                  static_cast<unsigned>(first.at));
+    *why = text;
+  }
+  return state == ShHeapState::kSound;
+}
 
 }  // namespace coffer
 

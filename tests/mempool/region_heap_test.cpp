@@ -1,325 +1,164 @@
-// The region heap: exact layouts of sharp small cases, a randomized comparison
-// with an independent model of the allocator, and the heap checker itself.
+// The region heap: random operations against the model, and scripts of the
+// sharp edges: exact layouts, refusals, and damaged regions as the checker
+// and the heap's own checks see them.
 #include <gtest/gtest.h>
 
-#include <algorithm>
-#include <iterator>
-#include <list>
-#include <map>
 #include <random>
+#include <sstream>
 
-#include "region_test_util.h"
+#include "heap_driver.h"
 
 namespace {
 
 using namespace coffer_test;
-
-// A fresh region with n blocks of the given size allocated from its start.
-std::vector<void *> Carve(Region &r, uint32_t regionSize, int n, uint32_t size) {
-  EXPECT_EQ(SH_Reset(r.base(), regionSize), 0);
-  std::vector<void *> p;
-  for (int i = 0; i < n; ++i) p.push_back(SH_Alloc(r.base(), size));
-  return p;
-}
-
-TEST(RegionHeap, ResetRefusesTinySizesAndFormatsOneBlock) {
-  for (uint32_t size : {0u, 1u, 16u, 32u}) {
-    Region r(64);
-    auto before = r.Snapshot();
-    EXPECT_EQ(SH_Reset(r.base(), size), -1) << size;
-    EXPECT_EQ(r.Snapshot(), before) << size;
-  }
-  Region r(4096);
-  ASSERT_EQ(SH_Reset(r.base(), 4096), 0);
-  EXPECT_EQ(r.head()->regionSize, 4096u);
-  EXPECT_EQ(r.head()->freeHead, 16u);
-  EXPECT_EQ(r.head()->reserved[0], 0xA5A5A5A5u);  // never written
-  EXPECT_EQ(r.head()->reserved[1], 0xA5A5A5A5u);
-  ExpectBlock(r, 16, 4080, 0, kNone, kNone);
-  for (uint32_t i = 32; i < 4096; ++i) ASSERT_EQ(static_cast<uint8_t>(r.bytes()[i]), 0xA5) << i;
-}
-
-TEST(RegionHeap, SmallestRegionServesOnlySizeZero) {
-  Region r(33);
-  ASSERT_EQ(SH_Reset(r.base(), 33), 0);
-  ExpectBlock(r, 16, 17, 0, kNone, kNone);
-  EXPECT_EQ(SH_Alloc(r.base(), 1), nullptr);
-  EXPECT_EQ(r.off(SH_Alloc(r.base(), 0)), 32u);
-  ExpectBlock(r, 16, 17, 0, 0, 0);  // taken whole: nothing to split off
-  EXPECT_EQ(r.head()->freeHead, kNone);
-  EXPECT_EQ(SH_Alloc(r.base(), 0), nullptr);  // the free list is empty
-}
-
-TEST(RegionHeap, AllocSplitsOnlyWhenTheRestHasRoom) {
-  Region r(4096);
-  SH_Reset(r.base(), 4096);
-  EXPECT_EQ(r.off(SH_Alloc(r.base(), 5)), 32u);
-  ExpectBlock(r, 16, 24, 0, 0, 0);
-  ExpectBlock(r, 40, 4056, 24, kNone, kNone);
-  EXPECT_EQ(r.head()->freeHead, 40u);
-  EXPECT_EQ(static_cast<uint8_t>(r.bytes()[32]), 0xA5);  // the payload is not cleared
-  EXPECT_EQ(r.off(SH_Alloc(r.base(), 0)), 56u);          // an empty block, split off
-  ExpectBlock(r, 40, 16, 24, 0, 0);
-  ExpectBlock(r, 56, 4040, 16, kNone, kNone);
-
-  Region a(64), b(64);
-  SH_Reset(a.base(), 64);
-  SH_Reset(b.base(), 64);
-  EXPECT_EQ(a.off(SH_Alloc(a.base(), 16)), 32u);
-  ExpectBlock(a, 16, 48, 0, 0, 0);  // 16 bytes left over stay inside
-  EXPECT_EQ(b.off(SH_Alloc(b.base(), 12)), 32u);
-  ExpectBlock(b, 16, 28, 0, 0, 0);
-  ExpectBlock(b, 44, 20, 28, kNone, kNone);
-}
-
-TEST(RegionHeap, LowerOfTheFirstTwoFitsWins) {
-  Region r(1024);
-  auto p = Carve(r, 1024, 5, 16);
-  for (int i = 0; i < 5; ++i) EXPECT_EQ(r.off(p[i]), 32u + 32u * i);
-  SH_Free(r.base(), p[1]);
-  SH_Free(r.base(), p[3]);
-  EXPECT_EQ(r.head()->freeHead, 112u);  // the fourth block heads the list
-  EXPECT_EQ(r.off(SH_Alloc(r.base(), 16)), 64u);
-}
-
-TEST(RegionHeap, FreeMergesWithBothNeighbours) {
-  Region r(1024);
-  auto p = Carve(r, 1024, 6, 16);
-  SH_Free(r.base(), p[2]);  // 80: alone
-  SH_Free(r.base(), p[1]);  // 48: absorbs 80 forward
-  ExpectBlock(r, 48, 64, 32, 208, kNone);
-  SH_Free(r.base(), p[3]);  // 112: absorbed backward into 48
-  EXPECT_EQ(r.head()->freeHead, 48u);
-  ExpectBlock(r, 48, 96, 32, 208, kNone);
-  EXPECT_EQ(r.block(144)->prevBlockSize, 96u);
-}
-
-TEST(RegionHeap, ReallocMovesUnlessTheCapacityMatches) {
-  Region r(1024);
-  SH_Reset(r.base(), 1024);
-  void *p = SH_Alloc(r.base(), 21);  // capacity 24
-  FillPattern(p, 24, 1);
-  EXPECT_EQ(SH_Realloc(r.base(), p, 24), p);
-  void *q = SH_Realloc(r.base(), p, 8);  // smaller still moves
-  EXPECT_NE(q, p);
-  EXPECT_TRUE(HasPattern(q, 8, 1));
-  EXPECT_EQ(r.head()->freeHead, 16u);  // p is free again
-}
-
-// Refusals write nothing: the largest sizes do not wrap when rounded, and a
-// block is never resized in place, though p and its free neighbour would
-// hold 200 bytes together.
-TEST(RegionHeap, RefusalsAndNullFreeChangeNothing) {
-  Region r(256);
-  SH_Reset(r.base(), 256);
-  void *p = SH_Alloc(r.base(), 100);
-  FillPattern(p, 100, 9);
-  auto before = r.Snapshot();
-  for (uint32_t size : {0xFFFFFFFFu, 0xFFFFFFFDu, 0xFFFFFFFCu, 109u}) {
-    EXPECT_EQ(SH_Alloc(r.base(), size), nullptr) << size;
-    EXPECT_EQ(SH_Realloc(r.base(), p, size), nullptr) << size;
-  }
-  EXPECT_EQ(SH_Realloc(r.base(), p, 200), nullptr);
-  SH_Free(r.base(), nullptr);
-  EXPECT_EQ(r.Snapshot(), before);
-  EXPECT_EQ(r.off(SH_Alloc(r.base(), 108)), 148u);  // exactly the capacity left
-}
-
-TEST(RegionHeapCheck, DetectsEachKindOfDamage) {
-  const std::pair<void (*)(Region &), const char *> damages[] = {
-      {[](Region &r) { r.block(208)->blockSize += 4; },
-       "block runs past region end (block at 208)"},
-      {[](Region &r) { r.block(16)->blockSize = 30; },
-       "inner blockSize not a multiple of 4 (block at 16)"},
-      {[](Region &r) { r.block(80)->prevBlockSize = 36; }, "prevBlockSize mismatch (block at 80)"},
-      {[](Region &r) { r.block(80)->nextFree = r.block(80)->prevFree = kNone; },
-       "two adjacent free blocks (block at 80)"},
-      {[](Region &r) { r.block(48)->prevFree = 0; }, "free block with a 0 link (block at 48)"},
-      {[](Region &r) { r.block(112)->nextFree = 208; },
-       "prevFree does not name the previous block on the free list (block at 208)"},
-      {[](Region &r) { r.head()->freeHead = 116; },
-       "free list names something that is not a free block (block at 116)"},
-      {[](Region &r) { r.block(208)->nextFree = 112; },
-       "free list visits a block twice (block at 112)"},
-      {[](Region &r) { r.head()->freeHead = kNone; },
-       "free block missing from the free list (block at 48)"},
-  };
-  for (const auto &[damage, found] : damages) {
-    Region r(1024);
-    auto p = Carve(r, 1024, 6, 16);
-    SH_Free(r.base(), p[1]);
-    SH_Free(r.base(), p[3]);  // free list: 112, 48, 208
-    ASSERT_TRUE(HeapSound(r.base()));
-    damage(r);
-    std::string why;
-    EXPECT_FALSE(coffer::SHCheckHeap(r.base(), nullptr, &why));
-    EXPECT_EQ(why, found);
-  }
-}
-
-// ---- randomized comparison with a model ----------------------------------------
-
-// The allocator restated over a block map in address order and a free list in
-// list order. It deals in payload offsets (block offset + 16); 0 is "none".
-class Model {
- public:
-  explicit Model(uint32_t regionSize) : regionSize_(regionSize) {
-    blocks_[16] = {regionSize - 16, true};
-    freeList_.push_back(16);
-  }
-
-  uint32_t Alloc(uint32_t size) {
-    uint64_t need = (uint64_t{size} + 3) / 4 * 4 + 16;  // never wraps
-    auto chosen = freeList_.end();
-    for (auto it = freeList_.begin(); it != freeList_.end(); ++it) {
-      if (need > blocks_[*it].size) continue;
-      if (chosen != freeList_.end()) {
-        if (*it < *chosen) chosen = it;
-        break;
-      }
-      chosen = it;
-    }
-    if (chosen == freeList_.end()) return 0;
-    uint32_t off = *chosen;
-    Blk &b = blocks_[off];
-    if (b.size - need > 16) {
-      *chosen = off + static_cast<uint32_t>(need);
-      blocks_[*chosen] = {b.size - static_cast<uint32_t>(need), true};
-      b.size = static_cast<uint32_t>(need);
-    } else {
-      freeList_.erase(chosen);
-    }
-    b.free = false;
-    return off + 16;
-  }
-
-  void Free(uint32_t payload) {
-    uint32_t off = payload - 16;
-    freeList_.push_front(off);
-    auto it = blocks_.find(off);
-    it->second.free = true;
-    auto next = std::next(it);
-    if (next != blocks_.end() && next->second.free) {
-      freeList_.remove(next->first);
-      it->second.size += next->second.size;
-      blocks_.erase(next);
-    }
-    if (it != blocks_.begin() && std::prev(it)->second.free) {
-      freeList_.remove(off);
-      std::prev(it)->second.size += it->second.size;
-      blocks_.erase(it);
-    }
-  }
-
-  uint32_t Realloc(uint32_t payload, uint32_t size) {
-    if (payload == 0) return Alloc(size);
-    if (size == 0) return Free(payload), 0;
-    if (Capacity(payload) == size) return payload;
-    uint32_t n = Alloc(size);
-    if (n) Free(payload);
-    return n;
-  }
-
-  uint32_t Capacity(uint32_t payload) const { return blocks_.at(payload - 16).size - 16; }
-  size_t FreeBlocks() const { return freeList_.size(); }
-
-  // Compares the region header and every block header, word by word.
-  ::testing::AssertionResult Matches(Region &r) const {
-    std::map<uint32_t, std::pair<uint32_t, uint32_t>> links;  // off -> (next, prev)
-    uint32_t prev = kNone, prevSize = 0;
-    for (auto it = freeList_.begin(); it != freeList_.end(); prev = *it++)
-      links[*it] = {std::next(it) == freeList_.end() ? kNone : *std::next(it), prev};
-    std::vector<uint32_t> want = {regionSize_, freeList_.empty() ? kNone : freeList_.front()};
-    std::vector<uint32_t> got = {r.head()->regionSize, r.head()->freeHead};
-    for (const auto &[off, b] : blocks_) {
-      const ShBlockHeader *h = r.block(off);
-      auto link = b.free ? links.at(off) : std::make_pair(0u, 0u);
-      want.insert(want.end(), {off, b.size, prevSize, link.first, link.second});
-      got.insert(got.end(), {off, h->blockSize, h->prevBlockSize, h->nextFree, h->prevFree});
-      prevSize = b.size;
-    }
-    if (want == got) return ::testing::AssertionSuccess();
-    size_t i = std::mismatch(want.begin(), want.end(), got.begin()).first - want.begin();
-    uint32_t block = i < 2 ? 0 : want[i - (i + 3) % 5];  // 0: the region header
-    return ::testing::AssertionFailure()
-           << "header word " << i << " (block " << block << "): " << got[i] << " not " << want[i];
-  }
-
- private:
-  struct Blk {
-    uint32_t size;
-    bool free;
-  };
-  uint32_t regionSize_;
-  std::map<uint32_t, Blk> blocks_;
-  std::list<uint32_t> freeList_;
-};
-
-uint32_t RandomSize(std::mt19937 &rng, uint32_t regionSize) {
-  static const uint32_t huge[] = {0xFFFFFFFFu, 0xFFFFFFFEu, 0xFFFFFFFDu, 0xFFFFFFFCu, 0x80000000u};
-  uint32_t k = rng() % 100;
-  if (k < 5) return 0;
-  if (k < 45) return 1 + rng() % 32;
-  if (k < 85) return 33 + rng() % 480;
-  return k < 95 ? rng() % regionSize : huge[rng() % 5];
-}
-
-// Random allocations, releases and resizes (to 0, to the same capacity,
-// from null) on the heap and the model, which must agree on every header
-// after every step; every live block keeps the pattern written into it.
-void RunAgainstModel(uint32_t regionSize, uint32_t seed) {
-  SCOPED_TRACE("region " + std::to_string(regionSize) + " seed " + std::to_string(seed));
-  std::mt19937 rng(seed);
-  Region r(regionSize, static_cast<uint8_t>(seed));
-  ASSERT_EQ(SH_Reset(r.base(), regionSize), 0);
-  Model m(regionSize);
-  std::map<uint32_t, std::pair<uint32_t, uint32_t>> live;  // payload offset -> (size, tag)
-  auto intact = [&](uint32_t off) {
-    return HasPattern(r.at(off), live[off].first, live[off].second);
-  };
-  for (uint32_t step = 1; step <= 4000; ++step) {
-    uint32_t k = rng() % 100, size = RandomSize(rng, regionSize), off = 0, want = 0;
-    if (!live.empty() && k >= 45 && (k < 75 || rng() % 20 != 0))
-      off = std::next(live.begin(), rng() % live.size())->first;
-    ASSERT_TRUE(!off || intact(off));
-    void *p = nullptr;
-    if (k < 45 || live.empty()) {
-      want = m.Alloc(size);
-      p = SH_Alloc(r.base(), size);
-    } else if (k < 75) {
-      size = 0;  // a release, for the bookkeeping below
-      m.Free(off);
-      SH_Free(r.base(), r.at(off));
-    } else {
-      if (rng() % 10 < 3) size = rng() % 3 == 0 ? 0 : off ? m.Capacity(off) : size;
-      want = m.Realloc(off, size);
-      p = SH_Realloc(r.base(), off ? r.at(off) : nullptr, size);
-      ASSERT_TRUE(!p || !off || HasPattern(p, std::min(live[off].first, size), live[off].second));
-    }
-    ASSERT_EQ(r.off(p), want) << "step " << step << " k " << k << " off " << off << " size "
-                              << size;
-    if (off && (p || size == 0)) live.erase(off);
-    if (p) {
-      FillPattern(p, size, step);
-      live[want] = {size, step};
-    }
-    ASSERT_TRUE(m.Matches(r)) << "step " << step;
-    coffer::ShHeapCounts c;
-    ASSERT_TRUE(HeapSound(r.base(), &c));
-    ASSERT_EQ(c.freeBlocks, m.FreeBlocks());
-    ASSERT_EQ(c.allocatedBlocks, live.size());
-    for (const auto &blk : live) ASSERT_TRUE(step % 64 || intact(blk.first));
-  }
-  for (const auto &blk : live) SH_Free(r.base(), r.at(blk.first));
-  ExpectBlock(r, 16, regionSize - 16, 0, kNone, kNone);
-}
+using coffer::ShOutcome;
+using coffer::ShRefusal;
 
 TEST(RegionHeapModel, RandomOperationsMatchTheModel) {
-  for (uint32_t size : {33u, 64u, 257u, 1024u, 4099u, 65536u})
+  for (uint8_t sizeIndex = 0; sizeIndex < 7; ++sizeIndex)
     for (uint32_t seed = 1; seed <= 3; ++seed) {
-      RunAgainstModel(size, seed * 7919 + size);
-      if (HasFatalFailure()) return;
+      std::mt19937 rng(seed * 7919 + sizeIndex);
+      std::vector<uint8_t> bytes(4 * 3000);
+      for (auto &b : bytes) b = static_cast<uint8_t>(rng());
+      bytes[0] = sizeIndex;
+      ASSERT_EQ(DriveHeap(bytes.data(), bytes.size()), "") << int{sizeIndex} << " " << seed;
     }
+}
+
+// A script runs heap calls on a 4096-byte buffer filled with 0xA5, each
+// token with what it must return or leave. p<i> is the i-th block it got.
+//   R<size>[!]          SH_Reset returns 0 (!: -1)
+//   A<size>:<off>       allocation returns payload offset off (0: null)
+//   Z<i>,<size>:<off>   resize of p<i> (i 9: of null) returns off
+//   F<i>, F@<off>       release of p<i>, of the address region + off
+//   ...!<at>, ...#<at>  the call is refused, the region left as it was: not
+//                       an allocated block (at: its offset), damaged at at
+//   @<off>:<w>,...      the header words at off are these (-1: SH_NO_BLOCK)
+//   W<off>:<w>          writes a word there (damage)
+//   X<fault>@<at>,...   the checker, mapping the last R's size, reports
+//                       exactly these faults (ShFault numbers); X: none
+//   S, U                takes a snapshot; nothing changed since it
+std::vector<long long> Numbers(const std::string &t) {
+  std::vector<long long> v;
+  for (const char *s = t.c_str() + 1; *s;) {
+    char *end;
+    long long n = std::strtoll(s, &end, 0);
+    end == s ? ++s : (v.push_back(n), s = end);
+  }
+  return v;
+}
+
+void RunScript(const std::string &script) {
+  SCOPED_TRACE(script);
+  Region r(4096);
+  std::vector<void *> p;
+  std::vector<uint32_t> snap, before;
+  long long mapped = 0;
+  std::istringstream in(script);
+  for (std::string t; in >> t;) {
+    ShOutcome out = {ShRefusal::kNone, 0}, want = out;
+    size_t cut = t[0] == 'R' ? std::string::npos : t.find_first_of("!#");
+    if (cut != std::string::npos)
+      want = {t[cut] == '!' ? ShRefusal::kNotAllocated : ShRefusal::kDamaged,
+              uint32_t(std::stoll(t.substr(cut + 1)))};
+    std::vector<long long> v = Numbers(t.substr(0, cut));
+    auto block = [&](long long i) { return size_t(i) < p.size() ? p[i] : nullptr; };
+    std::vector<std::pair<coffer::ShFault, uint32_t>> faults, expected;
+    auto keep = [](void *c, coffer::ShFault f, uint32_t at) {
+      static_cast<decltype(faults) *>(c)->push_back({f, at});
+    };
+    void *q = nullptr;
+    before = r.words;
+    switch (t[0]) {
+      case 'R':
+        EXPECT_EQ(SH_Reset(r.base(), mapped = v[0]), t.back() == '!' ? -1 : 0) << t;
+        break;
+      case 'A':
+        if ((q = coffer::SHAllocChecked(r.base(), v[0], &out))) p.push_back(q);
+        EXPECT_EQ(r.off(q), v[1]) << t;
+        break;
+      case 'Z':
+        q = coffer::SHReallocChecked(r.base(), block(v[0]), v[1], &out);
+        EXPECT_EQ(r.off(q), v[2]) << t;
+        if (v[0] == 9 && q)
+          p.push_back(q);
+        else if (q || v[1] == 0)
+          p[v[0]] = q;
+        break;
+      case 'F':
+        coffer::SHFreeChecked(r.base(), t[1] == '@' ? r.base() + v[0] : block(v[0]), &out);
+        break;
+      case '@':
+        for (size_t i = 1; i < v.size(); ++i)
+          EXPECT_EQ(r.word(v[0])[i - 1], uint32_t(v[i])) << t << " word " << i - 1;
+        break;
+      case 'W':
+        *r.word(v[0]) = uint32_t(v[1]);
+        break;
+      case 'X':
+        for (size_t i = 0; i + 1 < v.size(); i += 2)
+          expected.push_back({coffer::ShFault(v[i]), v[i + 1]});
+        coffer::SHCheckRegion(r.base(), mapped, nullptr, keep, &faults);
+        EXPECT_EQ(faults, expected) << t;
+        break;
+      case 'S':
+        snap = r.words;
+        break;
+      default:
+        EXPECT_EQ(r.words, snap) << t;
+    }
+    EXPECT_EQ(out.refusal, want.refusal) << t;
+    EXPECT_EQ(out.at, want.at) << t;
+    EXPECT_TRUE(out.refusal == ShRefusal::kNone || r.words == before) << t;
+  }
+}
+
+// Blocks 16 48 80 112 144 176 (p0 to p5) and the rest at 208; 48 and 112
+// free, the free list 112 48 208.
+#define SIX "R1024 A16:32 A16:64 A16:96 A16:128 A16:160 A16:192 F1 F3 "
+
+TEST(RegionHeapEdges, Scripts) {
+  const char *scripts[] = {
+      // formatting, and the smallest region: one block that holds 0 bytes
+      "S R32! U R33 @0:33,16 @16:17,0,-1,-1 A1:0 A0:32 @0:33,-1 @16:17,0,0,0 A0:0",
+      // the reserved words and payloads are never written; a split when more
+      // than 16 bytes would be left, the whole block otherwise
+      "R4096 @0:4096,16,0xA5A5A5A5,0xA5A5A5A5 @16:4080,0,-1,-1 A5:32 @16:24,0,0,0 "
+      "@32:0xA5A5A5A5 @40:4056,24,-1,-1 A0:56 @40:16,24,0,0 @56:4040,16,-1,-1 @0:4096,56",
+      "R64 A16:32 @16:48,0,0,0 @0:64,-1",
+      "R64 A12:32 @16:28,0,0,0 @44:20,28,-1,-1",
+      // the lower of the first two fits, though the higher heads the list
+      "R1024 A16:32 A16:64 A16:96 A16:128 A16:160 F1 F3 @0:1024,112 @112:32,32,48,-1 A16:64",
+      // a release merges forward, then backward into a block that keeps its place
+      "R1024 A16:32 A16:64 A16:96 A16:128 A16:160 A16:192 F2 F1 @48:64,32,208,-1 "
+      "@208:816,32,-1,48 F3 @0:1024,48 @48:96,32,208,-1 @144:32,96,0,0",
+      // resizing: in place only at the exact capacity, otherwise moved
+      "R1024 A21:32 Z0,24:32 Z0,8:72 @0:1024,16 @16:40,0,80,-1 Z9,8:32 Z1,0:0 Z0,0:0 "
+      "@0:1024,16 @16:1008,0,-1,-1",
+      // refusals write nothing: sizes that would wrap, no room, no resize in
+      // place, a second release, addresses that are no payload of the region
+      "R256 A100:32 S A0xFFFFFFFF:0 A0xFFFFFFFD:0 A0xFFFFFFFC:0 A109:0 Z0,200:0 Z0,109:0 F9 U "
+      "A108:148 F0 F0!32 Z0,8:0!32 F@4!4 F@2000!2000 F@34!34 F@8!8",
+      // a resize checks the release before it allocates
+      "R256 A8:32 A8:56 F0 W20:36 Z1,4:0#16",
+      // one row per fault of the checker, with a heap call that meets it;
+      // free blocks side by side are untidy, not damage: joined when touched
+      SIX "W88:48 W92:112 W120:80 W60:80 X0@80,0@112 F4 X @48:128,32,208,-1 @176:32,128",
+      SIX "W0:32 X1@0 A1:0#0",
+      SIX "W0:1028 X2@0 F5#208",  // the heap cannot know the mapping
+      SIX "W208:808 X3@1016 F5#208",
+      SIX "W176:8 X4@176 F5#176",
+      SIX "W208:820 X5@208 A800:0#208",
+      SIX "W16:30 X6@16 F0#16",
+      SIX "W84:36 X7@80 F2#80",
+      SIX "W60:0 X8@48,13@208 A20:0#48",
+      SIX "W216:212 X9@208 A900:0#212",
+      SIX "W216:176 X10@208 A900:0#208",
+      SIX "W60:208 X11@48 A20:0#48",
+      SIX "W216:112 X12@208 A900:0#112",
+      SIX "W120:208 W124:-1 W220:112 X13@48 F2#48",
+  };
+  for (const char *s : scripts) RunScript(s);
 }
 
 }  // namespace

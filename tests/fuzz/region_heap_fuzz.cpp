@@ -1,0 +1,12 @@
+// The region heap through SH_* and both pools, against the model: the model
+// test's driver with the fuzzer's bytes.
+#include <cstdio>
+#include <cstdlib>
+
+#include "tests/mempool/heap_driver.h"
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
+  std::string fault = coffer_test::DriveHeap(data, size);
+  if (!fault.empty()) std::fprintf(stderr, "%s\n", fault.c_str()), std::abort();
+  return 0;
+}
