@@ -12,10 +12,6 @@
 #include <cstddef>
 #include <cstring>
 
-#ifdef COFFER_CHECKS
-#include <coffer/platform.h>
-#endif
-
 static_assert(sizeof(ShRegionHeader) == 16, "region header is 16 bytes");
 static_assert(offsetof(ShRegionHeader, regionSize) == 0 &&
                   offsetof(ShRegionHeader, freeHead) == 4 &&
@@ -356,23 +352,15 @@ void *Realloc(const Heap &h, void *ptr, size_t size, bool *changed) {
   return q;
 }
 
-#ifdef COFFER_CHECKS
 // A checking build checks the whole region after every call that changed
 // it and stops at once when the region is damaged. Only calls that went
 // through are checked: a refused call wrote nothing. A call that went
 // through on a region damaged where it did not look stops here too, so the
 // tests that expect such calls to go on (the kill test, the fuzz targets)
 // build the heap without this check.
-void CheckAfterCall(const Heap &h, const char *call) {
-  ShFault fault;
-  uint32_t at;
-  if (SHFirstDamage(h.base, h.size, &fault, &at))
-    Panic("Region heap check after %s: %s at offset %u.", call, SHFaultText(fault),
-          static_cast<unsigned>(at));
+void CheckAfterCall([[maybe_unused]] const Heap &h) {
+  COFFER_CHECK("region heap", SHCheckSound, h.base, h.size);
 }
-#else
-inline void CheckAfterCall(const Heap &, const char *) {}
-#endif
 
 }  // namespace
 
@@ -380,14 +368,14 @@ void *SHAllocChecked(void *region, size_t size, ShOutcome *out) {
   Heap h;
   if (!Open(&h, region, out)) return nullptr;
   void *p = Alloc(h, size);
-  if (p) CheckAfterCall(h, "SH_Alloc");
+  if (p) CheckAfterCall(h);
   return p;
 }
 
 void SHFreeChecked(void *region, void *ptr, ShOutcome *out) {
   Heap h;
   if (!Open(&h, region, out) || !ptr) return;
-  if (Free(h, ptr)) CheckAfterCall(h, "SH_Free");
+  if (Free(h, ptr)) CheckAfterCall(h);
 }
 
 void *SHReallocChecked(void *region, void *ptr, size_t size, ShOutcome *out) {
@@ -395,7 +383,7 @@ void *SHReallocChecked(void *region, void *ptr, size_t size, ShOutcome *out) {
   if (!Open(&h, region, out)) return nullptr;
   bool changed;
   void *p = Realloc(h, ptr, size, &changed);
-  if (changed && out->refusal == ShRefusal::kNone) CheckAfterCall(h, "SH_Realloc");
+  if (changed && out->refusal == ShRefusal::kNone) CheckAfterCall(h);
   return p;
 }
 

@@ -5,7 +5,8 @@
 #include <coffer/mempool.h>
 
 #include <cstdint>
-#include <cstdio>
+
+#include "mempool/check.h"
 
 namespace coffer {
 
@@ -85,37 +86,13 @@ typedef void (*ShFaultSink)(void *context, ShFault fault, uint32_t at);
 ShHeapState SHCheckRegion(const void *region, size_t mappedSize, ShHeapCounts *counts,
                           ShFaultSink sink, void *context);
 
-// True when the region is damaged; *fault and *at then tell the first damage.
-bool SHFirstDamage(const void *region, size_t mappedSize, ShFault *fault, uint32_t *at);
+// True when the region is not damaged (untidy is sound); otherwise *fault,
+// when given, tells the first damage. The form of every checker, for
+// COFFER_CHECK.
+bool SHCheckSound(const void *region, size_t mappedSize, CheckFault *fault);
 
 const char *SHFaultText(ShFault fault);
 inline bool SHFaultIsDamage(ShFault fault) { return fault != ShFault::kAdjacentFree; }
-
-// One-line form for tests: true when the region, mapped exactly as large as
-// its header says, is sound and tidy; otherwise *why (any string type) tells
-// the first fault.
-template <class Text>
-bool SHCheckHeap(const void *region, ShHeapCounts *counts, Text *why) {
-  struct First {
-    ShFault fault;
-    uint32_t at;
-    int seen;
-  } first = {ShFault::kAdjacentFree, 0, 0};
-  auto keep = [](void *c, ShFault f, uint32_t at) {
-    auto *p = static_cast<First *>(c);
-    if (!p->seen++) p->fault = f, p->at = at;
-  };
-  ShHeapState state = SHCheckRegion(region, static_cast<const ShRegionHeader *>(region)->regionSize,
-                                    counts, keep, &first);
-  if (state != ShHeapState::kSound && why) {
-    char text[128];
-    std::snprintf(text, sizeof text, "%s (block at %u)",
-                  first.seen ? SHFaultText(first.fault) : "checker out of memory",
-                  static_cast<unsigned>(first.at));
-    *why = text;
-  }
-  return state == ShHeapState::kSound;
-}
 
 }  // namespace coffer
 

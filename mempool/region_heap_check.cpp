@@ -159,17 +159,14 @@ ShHeapState SHCheckRegion(const void *region, size_t mappedSize, ShHeapCounts *c
   return w.damaged ? ShHeapState::kDamaged : w.untidy ? ShHeapState::kUntidy : ShHeapState::kSound;
 }
 
-bool SHFirstDamage(const void *region, size_t mappedSize, ShFault *fault, uint32_t *at) {
-  struct First {
-    ShFault *fault;
-    uint32_t *at;
-    bool seen;
-  } first = {fault, at, false};
-  auto keep = [](void *c, ShFault f, uint32_t off) {
-    auto *p = static_cast<First *>(c);
-    if (!p->seen && SHFaultIsDamage(f)) *p->fault = f, *p->at = off, p->seen = true;
+bool SHCheckSound(const void *region, size_t mappedSize, CheckFault *fault) {
+  CheckFault first = {nullptr, 0};
+  auto keep = [](void *c, ShFault f, uint32_t at) {
+    auto *p = static_cast<CheckFault *>(c);
+    if (!p->what && SHFaultIsDamage(f)) *p = {SHFaultText(f), at};
   };
-  return SHCheckRegion(region, mappedSize, nullptr, keep, &first) == ShHeapState::kDamaged;
+  if (SHCheckRegion(region, mappedSize, nullptr, keep, &first) != ShHeapState::kDamaged) return true;
+  return Fault(fault, first.what, first.at);
 }
 
 const char *SHFaultText(ShFault fault) {

@@ -39,10 +39,9 @@ void PanicIfRefused(const ShOutcome &out) {
 void Settle(void *base, void *ptr, bool failed, ShOutcome *out) {
   bool refused = out->refusal != ShRefusal::kNone;
   if (refused ? !ptr : !failed) return;  // a walk from freeHead is no caller's doing
-  coffer::ShFault fault;
-  uint32_t at;
-  if (coffer::SHFirstDamage(base, static_cast<ShRegionHeader *>(base)->regionSize, &fault, &at)) {
-    if (out->refusal != ShRefusal::kDamaged) *out = {ShRefusal::kDamaged, at};
+  coffer::CheckFault fault;
+  if (!coffer::SHCheckSound(base, static_cast<ShRegionHeader *>(base)->regionSize, &fault)) {
+    if (out->refusal != ShRefusal::kDamaged) *out = {ShRefusal::kDamaged, fault.at};
   } else if (refused) {
     *out = {ShRefusal::kNotAllocated, static_cast<uint32_t>(reinterpret_cast<uintptr_t>(ptr) -
                                                             reinterpret_cast<uintptr_t>(base))};

@@ -2,37 +2,45 @@
 # Builds every fuzz target, tests/fuzz/*_fuzz.cpp, with libFuzzer and the
 # address and undefined-behaviour sanitizers, and runs each for the given
 # number of seconds (default 60) from its corpus, tests/fuzz/corpus/<target>.
-# The library is compiled once, instrumented, into an archive each target
-# links with, so a target takes whatever library code it calls. Inputs that
-# add coverage go to build-fuzz/corpus/<target>, leaving the committed
-# corpus as it is; a crash is saved under build-fuzz/crashes and fails the run.
+# The library and the test support (models, drivers, test pool) are compiled
+# once, instrumented, into archives that every target links with, so a
+# target takes whatever it calls. Inputs that add coverage go to
+# build-fuzz/corpus/<target>, leaving the committed corpus as it is; a crash
+# is saved under build-fuzz/crashes and fails the run.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 seconds=${1:-60}
 out=build-fuzz
 mkdir -p "$out/obj" "$out/crashes"
 flags=(-m32 -g -O1 -std=c++17 -fno-exceptions -fsanitize=address,undefined
-  -fno-sanitize-recover=all -Wall -Wextra -Werror -Iinclude -I.)
+  -fno-sanitize-recover=all -Wall -Wextra -Werror -Iinclude -I. -Itests)
 
-library=(platform/*.cpp mempool/*.cpp esa/*.cpp rbt/*.cpp hst/*.cpp hstaa/*.cpp)
-archive=$out/libcoffer-fuzz.a
-if [[ ! -f $archive ]] || [[ -n $(find include platform mempool esa rbt hst hstaa -newer "$archive" \
-  -name '*.[ch]*' -print -quit) ]]; then
-  echo "== library"
-  objs=()
-  for src in "${library[@]}"; do
+# archive NAME SOURCE... : compiles the sources into $out/NAME.a when any
+# source or header has changed since.
+archive() {
+  local name=$1 objs=() src obj
+  shift
+  if [[ -f $out/$name.a ]] && [[ -z $(find include platform mempool esa rbt hst hstaa tests/support \
+    -newer "$out/$name.a" -name '*.[ch]*' -print -quit) ]]; then
+    return
+  fi
+  echo "== $name"
+  for src in "$@"; do
     obj=$out/obj/${src//\//_}.o
     clang++ "${flags[@]}" -fsanitize=fuzzer-no-link -c "$src" -o "$obj"
     objs+=("$obj")
   done
-  rm -f "$archive"
-  ar rcs "$archive" "${objs[@]}"
-fi
+  rm -f "$out/$name.a"
+  ar rcs "$out/$name.a" "${objs[@]}"
+}
+archive library platform/*.cpp mempool/*.cpp esa/*.cpp rbt/*.cpp hst/*.cpp hstaa/*.cpp
+archive support tests/support/*.cpp
 
 for src in tests/fuzz/*_fuzz.cpp; do
   name=$(basename "$src" .cpp)
   echo "== $name: ${seconds}s"
-  clang++ "${flags[@]}" -fsanitize=fuzzer "$src" "$archive" -lpthread -o "$out/$name"
+  clang++ "${flags[@]}" -fsanitize=fuzzer "$src" "$out/support.a" "$out/library.a" -lpthread \
+    -o "$out/$name"
   mkdir -p "$out/corpus/$name" "tests/fuzz/corpus/$name"
   status=0
   "$out/$name" -max_total_time="$seconds" -timeout=10 -rss_limit_mb=2048 -print_final_stats=1 \

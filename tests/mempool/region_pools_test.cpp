@@ -80,8 +80,8 @@ TEST(RegionPools, SharedPoolLocksExactlyTheHeapCall) {
     }
     EXPECT_EQ(atRelease, r.words) << i;
     trace = LockTrace();
-    std::string why;
-    EXPECT_TRUE(coffer::SHCheckHeap(r.base(), nullptr, &why)) << why;
+    EXPECT_EQ(coffer::SHCheckRegion(r.base(), 4096, nullptr, nullptr, nullptr),
+              coffer::ShHeapState::kSound);
   }
 }
 
