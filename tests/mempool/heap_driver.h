@@ -42,18 +42,16 @@ struct Region {
   std::vector<uint32_t> words;
 };
 
-// The allocator restated over a block map in address order and a free list
-// in list order. Offsets are of blocks; calls take and give payload offsets
-// (block + 16), 0 for none.
+// The allocator restated over a block map (offset -> size, free) and a free
+// list in list order. Calls take and give payload offsets, 0 for none.
 class HeapModel {
  public:
   explicit HeapModel(uint32_t size) : size_(size), list_{16} { blocks_[16] = {size - 16, true}; }
 
-  // The block an allocation of size bytes would take, or 0.
-  uint32_t Fit(uint64_t size) const {
+  uint32_t Fit(uint64_t size) const {  // the block an allocation would take, or 0
     uint32_t chosen = 0;
     for (uint32_t o : list_) {
-      if ((size + 3) / 4 * 4 + 16 > blocks_.at(o).size) continue;
+      if ((size + 3) / 4 * 4 + 16 > blocks_.at(o).first) continue;
       if (chosen) return std::min(chosen, o);
       chosen = o;
     }
@@ -63,20 +61,20 @@ class HeapModel {
     uint32_t off = Fit(size), need = uint32_t((size + 3) / 4 * 4 + 16);
     if (!off) return 0;
     auto at = std::find(list_.begin(), list_.end(), off);
-    Blk &b = blocks_[off];
-    if (b.size - need > 16)  // the rest takes the block's place on the list
-      blocks_[ *at = off + need] = {b.size - need, true}, b.size = need;
+    auto &b = blocks_[off];
+    if (b.first - need > 16)  // the rest takes the block's place on the list
+      blocks_[ *at = off + need] = {b.first - need, true}, b.first = need;
     else
       list_.erase(at);
-    b.free = false;
+    b.second = false;
     return off + 16;
   }
   void Free(uint32_t payload) {
     auto it = blocks_.find(payload - 16), next = std::next(it);
-    it->second.free = true;
+    it->second.second = true;
     list_.insert(list_.begin(), it->first);
-    if (next != blocks_.end() && next->second.free) Absorb(it, next);
-    if (it != blocks_.begin() && std::prev(it)->second.free) Absorb(std::prev(it), it);
+    if (next != blocks_.end() && next->second.second) Absorb(it, next);
+    if (it != blocks_.begin() && std::prev(it)->second.second) Absorb(std::prev(it), it);
   }
   uint32_t Realloc(uint32_t payload, uint32_t size) {
     if (!payload) return Alloc(size);
@@ -86,56 +84,47 @@ class HeapModel {
     if (moved) Free(payload);
     return moved;
   }
-  uint32_t Capacity(uint32_t payload) const { return blocks_.at(payload - 16).size - 16; }
+  uint32_t Capacity(uint32_t payload) const { return blocks_.at(payload - 16).first - 16; }
 
   // "" when every header word and the checker's counts agree with the model.
   std::string Differs(char *region) const {
     auto word = [&](uint32_t off, int i) { return reinterpret_cast<uint32_t *>(region + off)[i]; };
-    std::vector<uint32_t> want = {size_, list_.empty() ? SH_NO_BLOCK : list_[0]}, got, next(2),
-                          prev(2);
-    got = {word(0, 0), word(0, 1)};
+    if (word(0, 0) != size_ || word(0, 1) != (list_.empty() ? SH_NO_BLOCK : list_[0]))
+      return "the region header";
     std::map<uint32_t, size_t> place;  // on the free list
     for (size_t i = 0; i < list_.size(); ++i) place[list_[i]] = i;
     coffer::ShHeapCounts c, m{};
+    m.freeListLength = uint32_t(list_.size());
     uint32_t prevSize = 0;
     for (const auto &[off, b] : blocks_) {
-      size_t i = place.count(off) ? place[off] : 0;
-      uint32_t nf = i + 1 < list_.size() ? list_[i + 1] : SH_NO_BLOCK,
-               pf = i ? list_[i - 1] : SH_NO_BLOCK;
-      want.insert(want.end(), {off, b.size, prevSize, b.free ? nf : 0, b.free ? pf : 0});
-      got.insert(got.end(), {off, word(off, 0), word(off, 1), word(off, 2), word(off, 3)});
-      prevSize = b.size;
-      (b.free ? m.freeBlocks : m.allocatedBlocks)++;
-      (b.free ? m.freeBytes : m.allocatedBytes) += b.size;
-      m.largestFree = std::max(m.largestFree, b.free ? b.size : 0);
-      m.sizeLog2[31 - __builtin_clz(b.size)]++;
-    }
-    m.freeListLength = uint32_t(list_.size());
-    if (want != got) {
-      size_t i = std::mismatch(want.begin(), want.end(), got.begin()).first - want.begin();
-      return "header word " + std::to_string(i) + " (block " +
-             std::to_string(i < 2 ? 0 : want[i - (i + 3) % 5]) + "): " + std::to_string(got[i]) +
-             " not " + std::to_string(want[i]);
+      size_t i = b.second ? place.at(off) : 0;
+      uint32_t next = i + 1 < list_.size() ? list_[i + 1] : SH_NO_BLOCK,
+               prev = i ? list_[i - 1] : SH_NO_BLOCK;
+      const uint32_t want[4] = {b.first, prevSize, b.second ? next : 0, b.second ? prev : 0};
+      for (int k = 0; k < 4; ++k)
+        if (word(off, k) != want[k])
+          return "word " + std::to_string(k) + " of block " + std::to_string(off);
+      prevSize = b.first;
+      (b.second ? m.freeBlocks : m.allocatedBlocks)++;
+      (b.second ? m.freeBytes : m.allocatedBytes) += b.first;
+      m.largestFree = std::max(m.largestFree, b.second ? b.first : 0);
+      m.sizeLog2[31 - __builtin_clz(b.first)]++;
     }
     if (coffer::SHCheckRegion(region, size_, &c, nullptr, nullptr) != coffer::ShHeapState::kSound)
       return "the checker finds a fault";
-    return std::memcmp(&c, &m, sizeof c) ? "the checker's counts differ" : "";
+    return std::memcmp(&c, &m, sizeof c) ? "the checker's counts" : "";
   }
 
  private:
-  struct Blk {
-    uint32_t size;
-    bool free;
-  };
-  using It = std::map<uint32_t, Blk>::iterator;
+  using It = std::map<uint32_t, std::pair<uint32_t, bool>>::iterator;
   void Absorb(It keeper, It absorbed) {
     list_.erase(std::find(list_.begin(), list_.end(), absorbed->first));
-    keeper->second.size += absorbed->second.size;
+    keeper->second.first += absorbed->second.first;
     blocks_.erase(absorbed);
   }
   uint32_t size_;
   std::vector<uint32_t> list_;
-  std::map<uint32_t, Blk> blocks_;
+  std::map<uint32_t, std::pair<uint32_t, bool>> blocks_;  // block -> (size, free)
 };
 
 // Four bytes an operation: what (alloc, free, realloc, calloc) through what
@@ -186,12 +175,12 @@ inline std::string DriveHeap(const uint8_t *data, size_t n) {
       if (got && !Stamped(got, std::min(live[off].first, size), live[off].second))
         fault = "contents lost";
     } else {
-      if (via != 2 || !model.Fit(size / count * count)) mp = &pools[1];
-      want = model.Alloc(size / count * count);
-      got = mp->calloc(mp, count, size / count);
       size = size / count * count;
-      if (got && std::count(static_cast<char *>(got), static_cast<char *>(got) + size, 0) !=
-                     ptrdiff_t(size))
+      if (via != 2 || !model.Fit(size)) mp = &pools[1];
+      want = model.Alloc(size);
+      got = mp->calloc(mp, count, size / count);
+      if (got &&
+          std::count(static_cast<char *>(got), static_cast<char *>(got) + size, 0) != long(size))
         fault = "calloc left bytes unzeroed";
     }
     if (region.off(got) != want)
