@@ -5,8 +5,8 @@
 // Other processes write the region too, so every header word is checked
 // before it is used, and each call reads and checks all it will touch before
 // its first write. A call that finds a bad word refuses and writes nothing.
-// The checks are those of a well-formed region, so on one the calls make
-// exactly the writes they always made, in the same order.
+// The checks are those of a well-formed region, so on one the calls leave
+// exactly the bytes they always left.
 #include "mempool/region_heap.h"
 
 #include <cstddef>
@@ -55,9 +55,9 @@ struct Heap {
   // region can do that) takes it back and writes nothing. An allocation
   // writes at most 12 words.
   struct Journal {
-    uint32_t *word[12], old[12];
+    uint32_t *word[16], old[16];
     int n;
-  } *journal;
+  } * journal;
 
   // Every header write goes through here, so the kill test can stop a call
   // between any two of them.
@@ -264,7 +264,8 @@ void Split(const Heap &h, uint32_t off, uint32_t need) {
   h.Put(rest->nextFree, b->nextFree);
   h.Put(rest->prevFree, off);
   if (b->nextFree != kNone) h.Put(h.at(b->nextFree)->prevFree, restOff);
-  if (h.HasSuccessor(restOff)) h.Put(h.at(restOff + rest->blockSize)->prevBlockSize, rest->blockSize);
+  if (h.HasSuccessor(restOff))
+    h.Put(h.at(restOff + rest->blockSize)->prevBlockSize, rest->blockSize);
   h.Put(b->blockSize, need);
   h.Put(b->nextFree, restOff);
 }

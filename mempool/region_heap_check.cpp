@@ -165,7 +165,8 @@ bool SHCheckSound(const void *region, size_t mappedSize, CheckFault *fault) {
     auto *p = static_cast<CheckFault *>(c);
     if (!p->what && SHFaultIsDamage(f)) *p = {SHFaultText(f), at};
   };
-  if (SHCheckRegion(region, mappedSize, nullptr, keep, &first) != ShHeapState::kDamaged) return true;
+  if (SHCheckRegion(region, mappedSize, nullptr, keep, &first) != ShHeapState::kDamaged)
+    return true;
   return Fault(fault, first.what, first.at);
 }
 
