@@ -187,8 +187,7 @@ const char *SHFaultText(ShFault fault) {
       "free list comes back to a block it visited",
       "free block missing from the free list",
   };
-  unsigned i = static_cast<unsigned>(fault);
-  return i < kShFaultKinds ? kText[i] : "unknown fault";
+  return kText[static_cast<unsigned>(fault)];
 }
 
 }  // namespace coffer
