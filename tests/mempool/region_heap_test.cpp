@@ -149,6 +149,7 @@ TEST(RegionHeapEdges, Scripts) {
       SIX "W208:808 X3@1016 F5#208",
       SIX "W176:8 X4@176 F5#176",
       SIX "W208:820 X5@208 A800:0#208",
+      SIX "W208:820 X5@208 A16:0#208",      // met as the next on the list
       SIX "W16:30 X6@16 F0#16",
       SIX "W84:36 X7@80 F2#80",
       SIX "W60:0 X8@48,13@208 A20:0#48",
