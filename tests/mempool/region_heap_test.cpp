@@ -159,6 +159,9 @@ TEST(RegionHeapEdges, Scripts) {
       SIX "W60:208 X11@48 A20:0#48",
       SIX "W216:112 X12@208 A900:0#112",
       SIX "W120:208 W124:-1 W220:112 X13@48 F2#48",
+      // a resize whose allocation, from a block too large, breaks the release
+      // it checked before: the allocation is undone
+      SIX "W48:200 W252:200 Z4,24:0#80",
   };
   for (const char *s : scripts) RunScript(s);
 }
