@@ -137,41 +137,31 @@ bool Unlinkable(const Heap &h, uint32_t off) {
 
 // Walks the free list and stops at the second block that can hold r bytes;
 // of the (at most) two, the lower one wins, which keeps the heap compact
-// without the cost of a full best-fit scan. This is the hot loop, so each
-// step checks only what it reads: the link (a header in the region), the
-// back link and the range of the size; a torn block's 0 link fails the next
-// step, and the caller checks the rest of the block it takes. No sound list
-// is longer than the blocks the region can hold, so a longer walk has met
-// overlapping headers.
-bool FindFit(const Heap &h, uint32_t r, uint32_t *chosen) {
+// without the cost of a full best-fit scan. This is the hot loop, so a step
+// checks what it follows: the link (a header in the region) and the back
+// link. A size only steers the choice, and the caller checks the whole of
+// the block it takes; a torn block's 0 link fails the next step. No sound
+// list is longer than the blocks the region can hold, so a longer walk has
+// met overlapping headers. The walk has checked the chosen block's next on
+// the list unless it stopped at the chosen block itself.
+bool FindFit(const Heap &h, uint32_t r, uint32_t *chosen, bool *nextChecked) {
   *chosen = kNone;
-  const uint32_t size = h.size, most = size / kHead;
-  uint32_t from = kNone, steps = 0;
+  *nextChecked = true;
+  uint32_t from = kNone, budget = h.size / kHead + 1;
   for (uint32_t o = h.head()->freeHead; o != kNone; from = o, o = h.at(o)->nextFree) {
-    uint32_t holder = from == kNone ? 0 : from;
-    if (!h.Fits(o)) return h.Damaged(holder);
+    if (!h.Fits(o)) return h.Damaged(from == kNone ? 0 : from);
     const ShBlockHeader *b = h.at(o);
-    uint32_t room = b->blockSize - kHead;
-    if (b->prevFree != from || room > size - o - kHead || ++steps > most)
-      return h.Damaged(UseOf(b) == Use::kAllocated ? holder : o);
-    if (r > room) continue;
+    if (b->prevFree != from || --budget == 0)
+      return h.Damaged(UseOf(b) == Use::kAllocated && from != kNone ? from : o);
+    if (r > b->blockSize - kHead) continue;
     if (*chosen == kNone) {
       *chosen = o;
     } else {
-      if (o < *chosen) *chosen = o;
+      if (o < *chosen) *chosen = o, *nextChecked = false;
       break;
     }
   }
   return true;
-}
-
-// The block after off (whose size fits), if any, is a header in the region
-// whose prevBlockSize agrees.
-bool SuccessorAgrees(const Heap &h, uint32_t off) {
-  uint32_t size = h.at(off)->blockSize, next = off + size;
-  if (next == h.size) return true;
-  if (!h.Fits(next)) return h.Damaged(off);
-  return h.at(next)->prevBlockSize == size || h.Damaged(next);
 }
 
 // ptr is the payload of an allocated block of this region whose size fits.
@@ -295,15 +285,20 @@ void *Alloc(const Heap &h, size_t size) {
   if (size > kLargestRoundable) return nullptr;
   uint32_t r = (static_cast<uint32_t>(size) + 3u) & ~3u;
   uint32_t off;
-  if (h.head()->freeHead == kNone || !FindFit(h, r, &off) || off == kNone) return nullptr;
+  bool nextChecked;
+  if (h.head()->freeHead == kNone || !FindFit(h, r, &off, &nextChecked) || off == kNone)
+    return nullptr;
   // A remainder of 16 bytes or less would be a block with no room, so the
-  // whole block goes out instead. The fit leaves need <= blockSize.
+  // whole block goes out instead. The fit leaves need <= blockSize. A split
+  // rewrites the prevBlockSize of the block after, which must have room for
+  // its header; the list neighbours it rewrites are checked.
   ShBlockHeader *b = h.at(off);
-  uint32_t need = r + kHead;
+  uint32_t need = r + kHead, next = off + b->blockSize;
   bool split = need < b->blockSize - kHead;
-  if (b->nextFree == 0 || !h.SizeFits(off, b->blockSize)) return h.Damaged(off), nullptr;
-  if (b->nextFree != kNone && !ListStep(h, off, b->nextFree)) return nullptr;
-  if (split && !SuccessorAgrees(h, off)) return nullptr;
+  if (b->nextFree == 0 || !h.SizeFits(off, b->blockSize) ||
+      (split && next != h.size && !h.Fits(next)))
+    return h.Damaged(off), nullptr;
+  if (!nextChecked && b->nextFree != kNone && !ListStep(h, off, b->nextFree)) return nullptr;
   if (split) Split(h, off, need);
   Unlink(h, off);
   h.Put(b->nextFree, 0);
