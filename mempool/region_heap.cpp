@@ -2,9 +2,9 @@
 // inside a caller-supplied region and links blocks by region offset, so one
 // region can be mapped at different addresses by several processes.
 //
-// Other processes write the region too, so every header word is checked
-// before it is used, and each call reads and checks all it will touch before
-// its first write. A call that finds a bad word refuses and writes nothing.
+// Other processes write the region too, so a call checks the header words
+// it acts on, and reads and checks all it will touch before its first write.
+// A call that finds a bad word refuses and writes nothing.
 // The checks are those of a well-formed region, so on one the calls leave
 // exactly the bytes they always left.
 #include "mempool/region_heap.h"

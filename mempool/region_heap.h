@@ -11,11 +11,13 @@
 namespace coffer {
 
 // ---- checked heap calls ----------------------------------------------------
-// A region is memory that other processes write too, so the heap checks every
-// header word it reads before it uses it. A call that meets a word that fails
-// its check refuses and writes nothing: allocation and resizing return null,
-// a release leaves the region as it was. The exported SH_* calls are these
-// with the outcome dropped; the pools keep it to report why they failed.
+// A region is memory that other processes write too, so the heap checks the
+// header words it reads before it acts on them: a link before it is followed,
+// a block before it is taken or joined, a neighbour before it is written, and
+// every walk is bounded. A call that meets a word that fails its check
+// refuses and writes nothing: allocation and resizing return null, a release
+// leaves the region as it was. The exported SH_* calls are these with the
+// outcome dropped; the pools keep it to report why they failed.
 
 enum class ShRefusal : uint32_t {
   kNone,          // done, or out of room
@@ -81,7 +83,7 @@ typedef void (*ShFaultSink)(void *context, ShFault fault, uint32_t at);
 // Checks the region at `region`, of which mappedSize bytes are readable;
 // counts (when not null) gets the statistics. kNoMemory: the checker could
 // not get its bitmaps (one bit per 4 bytes of region, twice) and checked
-// nothing. Allocates with malloc and uses no C++ runtime, so the library and
+// no further than the region header. Allocates with malloc and uses no C++ runtime, so the library and
 // tools can run it anywhere.
 ShHeapState SHCheckRegion(const void *region, size_t mappedSize, ShHeapCounts *counts,
                           ShFaultSink sink, void *context);
