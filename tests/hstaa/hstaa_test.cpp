@@ -52,7 +52,8 @@ TEST(Hstaa, PathsThatNameNothingAndIdleModes) {
   EXPECT_TRUE(HSTAAPropagateVal(&t, HSTAA_PROPAGATE_INSERT, l, HST_Find(&t.hst, "/l/#1"), rest, 5));
   EXPECT_EQ(HST_GetVal(&t.hst, HST_Find(&t.hst, "/l/#1/p")), 1u);
   EXPECT_EQ(HSTAA_GetSubtreeValCount(&t, root), 1);
-  HST_FreeTree(&t.hst);
+  HST_FreeTree(&t.hst);  // the caller's handle stays, naming no record
+  EXPECT_EQ(t.hst.data, nullptr);
 }
 
 #ifndef __SANITIZE_ADDRESS__  // the sanitizer owns malloc there, and finds leaks itself

@@ -30,7 +30,8 @@ TEST(Rbt, PoolCallsAndReleasesInOrder) {
   RbtInt32_FreeTree(i);
   RbtTree h = {*tp.pool(), nullptr, nullptr, false, nullptr};  // a caller's handle
   EXPECT_EQ(RbtVoidPtr_CreateTreeData(&h, nullptr), 1);
-  RbtVoidPtr_FreeTree(&h);  // not owned: the handle stays
+  RbtVoidPtr_FreeTree(&h);  // not owned: the handle stays, naming no record
+  EXPECT_EQ(h.data, nullptr);
   RBT_FreeTree(nullptr);
   RbtInt32_FreeTree(nullptr);
   RbtVoidPtr_FreeTree(nullptr);
