@@ -28,16 +28,21 @@ TEST(Hstaa, KeyClasses) {
 
 bool Add(HstaaTree *, CofferVal cur, CofferVal op, CofferVal *out) { return *out = cur + op, true; }
 
+// A tree on the process heap whose callbacks add the operand.
+struct Tree : HstaaTree {
+  Tree() : HstaaTree{} {
+    MemPool_InitOnStdHeap(&hst.mp);
+    insertValFn = removeValFn = Add;
+    cloneValFn = [](HstTree *, CofferVal v, CofferVal *out) { return *out = v, true; };
+    EXPECT_TRUE(HST_CreateTreeData(&hst, '/', 0, 1, 1));
+  }
+};
+
 // An empty absolute path has no first character to skip and names nothing;
 // a mode other than insertion and removal visits the elements and changes
 // nothing.
 TEST(Hstaa, PathsThatNameNothingAndIdleModes) {
-  HstaaTree t;
-  std::memset(&t, 0, sizeof t);
-  MemPool_InitOnStdHeap(&t.hst.mp);
-  t.insertValFn = t.removeValFn = Add;
-  t.cloneValFn = [](HstTree *, CofferVal v, CofferVal *out) { return *out = v, true; };
-  ASSERT_TRUE(HST_CreateTreeData(&t.hst, '/', 0, 1, 1));
+  Tree t;
   HstNode *root = HST_GetRoot(&t.hst);
   bool complete = true;
   EXPECT_EQ(HSTAA_FindPrefix(&t, "", &complete), root);
@@ -79,11 +84,7 @@ extern "C" void free(void *p) {
 namespace {
 
 TEST(Hstaa, PathCopies) {
-  HstaaTree t;
-  std::memset(&t, 0, sizeof t);
-  MemPool_InitOnStdHeap(&t.hst.mp);
-  t.insertValFn = t.removeValFn = Add;
-  ASSERT_TRUE(HST_CreateTreeData(&t.hst, '/', 0, 1, 1));
+  Tree t;
   HstNode *b = HSTAA_Insert(&t, "/a/b", 1);
   bool complete = false;
   const std::function<bool()> kCalls[] = {

@@ -57,22 +57,6 @@ TEST(Rbt, ReleaseSeesTheNodeStillInTheTree) {
   EXPECT_EQ(g_sizes, (std::vector<int32_t>{3, 1, 2, 1, 1, 1}));
 }
 
-// ownsNil travels with the sentinel, so neither free releases the caller's
-// sentinel nor leaks the tree's own.
-TEST(Rbt, SwapCarriesTheSentinelAndItsOwnership) {
-  TestPool tp;
-  RbtNode nil;
-  RbtTree *own = RBT_AllocTreeEx(tp.pool()), *lent = RBT_AllocTreeWithNil(tp.pool(), &nil);
-  RBT_Insert(own, "x", 1);
-  RBT_Swap(own, lent);
-  EXPECT_EQ(RBT_GetSize(own), 0);
-  EXPECT_STREQ(coffer::RecordAt<char>(lent, RBT_First(lent)->key), "x");
-  RBT_FreeTree(own);
-  RBT_FreeTree(lent);
-  EXPECT_EQ(tp.held(), 0u);
-  EXPECT_EQ(tp.misuse, "");
-}
-
 TEST(Rbt, CheckerFindsEachDamage) {
   RegionPool r(1024);
   RbtTree *t = RbtInt32_AllocTreeEx(&r.pool);

@@ -285,9 +285,17 @@ std::string RunHstModel(Ops &ops, Arena arena) {
     } else if (kind < 6) {  // find, through a path or by name
       MODEL_EXPECT(HST_Find(t, text.c_str()) == LibOf(Lookup(&m.root, p.names)));
       MODEL_EXPECT(HST_FindChild(t, x->lib, p.text.c_str()) == LibOf(Child(x, p.text)));
-    } else if (kind < 8 && !Child(x, p.text)) {  // a new child by name
+    } else if (kind == 6 && !Child(x, p.text)) {  // a new child by name
       HstNode *got = HST_InsertChild(t, x->lib, p.text.c_str(), next);
       MODEL_EXPECT(!got == op.Refused());
+      if (got) Attach(x, New(next), p.text);
+    } else if (kind == 7 && !Child(x, p.text)) {  // the same from a detached node, renamed
+      HstNode *n = HSTAllocNode(t, "-", next);
+      const bool renamed = n && HSTReplaceKey(t, n, p.text.c_str());
+      MODEL_EXPECT(!n || HST_GetKey(t, n) == (renamed ? p.text : "-"));
+      const bool got = renamed && HSTInsertChildNode(t, x->lib, n) == n;
+      if (n && !got) HSTFreeNode(t, n);  // still detached
+      MODEL_EXPECT(got != op.Refused());
       if (got) Attach(x, New(next), p.text);
     } else if (kind < 10) {  // remove a subtree; the root's empties the tree
       HST_RemoveSubtree(t, x->lib);
