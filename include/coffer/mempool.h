@@ -135,7 +135,12 @@ COFFER_API bool MemPool_InitOnStdHeap(MemPool *pool);
  * @par Panic
  * Not here. The pool's alloc and calloc panic when the region is exhausted,
  * calloc also when count x size does not fit in 32 bits, and realloc when it
- * cannot move a block to a nonzero size; each releases the lock first.
+ * cannot move a block to a nonzero size; each releases the lock first. Before
+ * reporting exhaustion, or when the heap refused a call, the pool checks the
+ * whole region under its lock: damage anywhere panics with "Shared heap
+ * region damaged at offset %u.", and a free or realloc of something that is
+ * no allocated block with "Shared heap: offset %u is not the payload of an
+ * allocated block."
  */
 COFFER_API bool MemPool_InitOnSharedHeap(MemPool *pool, void *region, size_t size,
                                          void *lock);
@@ -156,16 +161,22 @@ COFFER_API bool MemPool_InitOnSharedHeap(MemPool *pool, void *region, size_t siz
  * false leaves both the region and the record untouched.
  * @par Panic
  * Never, neither here nor in the pool's operations: containers on this pool
- * report exhaustion by their results.
+ * report exhaustion, and a damaged region, by their results; a refused
+ * release is ignored.
  */
 COFFER_API bool MemPool_InitOnSimpleHeap(MemPool *pool, void *region, size_t size);
 
 /* ---- region heap ---------------------------------------------------------
  * A formatted region is a 16-byte header followed by blocks that tile it.
  * Every field is a 32-bit region offset or size; nothing holds an address.
- * The SH_ calls take no lock and check none of their arguments: the region
- * must be formatted, and a payload given back must be one this region handed
- * out and that is still allocated. */
+ * The SH_ calls take no lock. Since other processes may write the region,
+ * they check every header word before they follow it: on a damaged region
+ * (a header that would lead a walk outside the region, into a loop or onto
+ * a block that is not there) SH_Alloc and SH_Realloc return null and SH_Free
+ * leaves the region as it is; they never write outside the region. The one
+ * word taken on trust is regionSize: the region must be at least that large.
+ * Two free blocks side by side, left by a release that was cut short, are
+ * not damage: they are merged when next touched. */
 
 /** The end of the free list, and the free-list links of an allocated block. */
 #define SH_NO_BLOCK 0xFFFFFFFFu
@@ -174,7 +185,7 @@ COFFER_API bool MemPool_InitOnSimpleHeap(MemPool *pool, void *region, size_t siz
 typedef struct ShRegionHeader {
   uint32_t regionSize;  /**< the whole region, header included */
   uint32_t freeHead;    /**< first free block, or SH_NO_BLOCK */
-  uint32_t reserved[2]; /**< never read or written by the heap */
+  uint32_t reserved[2]; /**< never read or written by the heap (named roots use them) */
 } ShRegionHeader;
 
 /** The header of every block; the payload follows it. */
@@ -212,8 +223,8 @@ COFFER_API int32_t SH_Reset(void *region, size_t size);
  * @par Ownership
  * The payload is the caller's until SH_Free or SH_Realloc gives it back.
  * @par Failure
- * null when no free block fits (or size exceeds 0xFFFFFFFC); the region is
- * unchanged.
+ * null when no free block fits (or size exceeds 0xFFFFFFFC), and on a damaged
+ * region; the region is unchanged.
  * @par Panic
  * Never.
  */
@@ -229,7 +240,9 @@ COFFER_API void *SH_Alloc(void *region, size_t size);
  * @par Ownership
  * ptr must not be used afterwards.
  * @par Failure
- * None.
+ * A pointer that is not the payload of an allocated block of this region (a
+ * second release, a foreign or misaligned address), or a damaged region around
+ * it, is refused: the region is left as it is.
  * @par Panic
  * Never.
  */
@@ -251,7 +264,9 @@ COFFER_API void SH_Free(void *region, void *ptr);
  * On success the old payload is released (unless returned) and the new one is
  * the caller's.
  * @par Failure
- * null with ptr still allocated and its contents intact.
+ * null with ptr still allocated and its contents intact; also when ptr is not
+ * an allocated payload of this region or the region is damaged, which leaves
+ * the region as it is.
  * @par Panic
  * Never.
  */
