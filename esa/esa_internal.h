@@ -23,8 +23,10 @@ inline const char *KeyOf(const EsaArray *arr, const EsaEntry *e) { return Record
 // Invariants of an array between calls: 0 <= size <= capacity; an entry
 // block exists whenever there are slots; every entry in use holds a key copy,
 // and the keys ascend in strcmp order. Equal keys keep their insertion order,
-// which no structure records, so only the order itself is checked.
-bool ESACheckArray(const EsaArray *arr, CheckFault *fault);  // true for no data
+// which no structure records, so only the order itself is checked. With a
+// span, every record and key must lie in it (see CheckSpan).
+bool ESACheckArray(const EsaArray *arr, CheckFault *fault,
+                   const CheckSpan *span = nullptr);  // true for no data
 
 // Reallocates the entry block to n slots. Refuses a negative count or one
 // whose byte size does not fit in 32 bits; a shrink to 0 slots always works.

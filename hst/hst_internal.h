@@ -37,7 +37,8 @@ inline EsaArray Children(HstTree *tree, HstNode *node) {
 // whose parent names the array's owner. With counts, as the associative
 // arrays keep them, every subtreeValCount is at least the sum of its
 // children's (what the node holds itself is not recorded anywhere else).
-bool HSTCheckTree(HstTree *tree, bool counts, CheckFault *fault);
+// With a span, every record and name must lie in it (see CheckSpan).
+bool HSTCheckTree(HstTree *tree, bool counts, CheckFault *fault, const CheckSpan *span = nullptr);
 
 // Checking builds check the tree whenever a call that changed it returns.
 // Only the calls a caller makes on a whole tree do so: the node primitives

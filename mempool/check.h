@@ -29,6 +29,27 @@ inline bool Fault(CheckFault *fault, const char *what, PoolOffset at) {
   return false;
 }
 
+// The pool offsets a checker may follow when the bytes it reads are not to
+// be trusted (a region read from a file, say): [lo, hi), usually the mapped
+// part of a region past its header. A record must lie wholly inside on a
+// 4-byte boundary, and a string must end inside. A checker given no span
+// trusts every link, as the library's checks of its own containers do, and
+// then behaves exactly as it always has.
+struct CheckSpan {
+  PoolOffset lo, hi;
+};
+
+inline bool SpanHolds(const CheckSpan *span, PoolOffset off, uint64_t bytes) {
+  return !span || (off >= span->lo && off % 4 == 0 && off <= span->hi && bytes <= span->hi - off);
+}
+
+inline bool SpanHoldsString(const CheckSpan *span, const MemPool *mp, PoolOffset off) {
+  if (!span) return true;
+  if (off < span->lo || off >= span->hi) return false;
+  const char *s = reinterpret_cast<const char *>(reinterpret_cast<uintptr_t>(mp->base) + off);
+  return __builtin_memchr(s, 0, span->hi - off) != nullptr;
+}
+
 }  // namespace coffer
 
 namespace coffer {

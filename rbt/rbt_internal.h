@@ -127,7 +127,13 @@ enum RbtKeyKind { kRbtStringKeys, kRbtInt32Keys, kRbtVoidPtrKeys };
 
 // Verifies the invariants stated in rbt_core.cpp: sentinel, colours, black
 // heights, parent links, key order and size. True for a handle without data.
-bool RBTCheckTree(const RbtTree *tree, RbtKeyKind kind, CheckFault *fault);
+// With a span, every record and key must lie in it (see CheckSpan).
+bool RBTCheckTree(const RbtTree *tree, RbtKeyKind kind, CheckFault *fault,
+                  const CheckSpan *span = nullptr);
+
+// The sentinel as every tree keeps it: black, its children itself, owned,
+// no value. Its parent is scratch space and may hold anything.
+bool RBTSentinelSound(const RbtCtx &c);
 
 // Lifecycle steps common to the families. RBTCreateTreeData builds the data
 // record and (without a caller's sentinel) the sentinel through the handle;
