@@ -12,5 +12,6 @@
 #include <coffer/rbt.h>
 #include <coffer/hst.h>
 #include <coffer/hstaa.h>
+#include <coffer/roots.h>
 
 #endif

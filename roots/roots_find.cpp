@@ -1,0 +1,185 @@
+// Reading a directory of named roots, and judging the records it names, in
+// a region whose bytes may be stale, damaged or hostile: every offset is
+// checked against the region before it is followed, and every walk is
+// bounded by the region's size.
+#include <cstddef>
+#include <cstring>
+
+#include "esa/esa_internal.h"
+#include "hst/hst_internal.h"
+#include "rbt/rbt_internal.h"
+#include "roots/roots_internal.h"
+
+static_assert(sizeof(RootsDirectory) == 20, "RootsDirectory is 20 bytes");
+static_assert(offsetof(RootsDirectory, magic) == 0 && offsetof(RootsDirectory, self) == 4 &&
+                  offsetof(RootsDirectory, entries) == 8 && offsetof(RootsDirectory, count) == 12 &&
+                  offsetof(RootsDirectory, capacity) == 16,
+              "RootsDirectory layout");
+static_assert(sizeof(RootsEntry) == 48, "RootsEntry is 48 bytes");
+static_assert(offsetof(RootsEntry, name) == 0 && offsetof(RootsEntry, kind) == 40 &&
+                  offsetof(RootsEntry, record) == 44,
+              "RootsEntry layout");
+
+namespace coffer {
+namespace {
+
+constexpr uint32_t kHead = sizeof(ShBlockHeader);
+
+// The capacity of the allocated block whose payload starts at payload, found
+// by walking the tiling from the first block; 0 when no allocated block
+// starts there. Each step moves at least a header forward, so the walk ends.
+uint32_t AllocatedCapacity(RegionView v, uint32_t payload) {
+  const uint32_t target = payload - kHead;
+  uint32_t o = kHead;
+  while (o < target) {
+    if (!v.Holds(o, kHead)) return 0;
+    const uint32_t size = v.At<ShBlockHeader>(o)->blockSize;
+    if (size < kHead || size % 4 != 0 || size > v.limit - o) return 0;
+    o += size;
+  }
+  if (o != target || !v.Holds(o, kHead)) return 0;
+  const ShBlockHeader *b = v.At<ShBlockHeader>(o);
+  if (b->nextFree != 0 || b->prevFree != 0 || b->blockSize < kHead || b->blockSize > v.limit - o)
+    return 0;
+  return b->blockSize - kHead;
+}
+
+// The same judged from the block's own header only, for records the
+// directory names: constant time, no walk.
+bool LooksAllocated(RegionView v, uint32_t payload, uint32_t bytes) {
+  if (payload < 2 * kHead || !v.Holds(payload - kHead, kHead + uint64_t{bytes})) return false;
+  const ShBlockHeader *b = v.At<ShBlockHeader>(payload - kHead);
+  return b->nextFree == 0 && b->prevFree == 0 && b->blockSize >= kHead + bytes &&
+         b->blockSize <= v.limit - (payload - kHead);
+}
+
+bool EntryNameSound(const RootsEntry &e) {
+  return e.name[0] != '\0' && std::memchr(e.name, 0, sizeof e.name) != nullptr;
+}
+
+const char *EntriesFault(RegionView v, const RootsDirectory *dir) {
+  const RootsEntry *e = RootsEntries(v, dir);
+  for (int32_t i = 0; i < dir->count; i++) {
+    if (!EntryNameSound(e[i])) return "a root's name is empty or unterminated";
+    if (i > 0 && std::strcmp(e[i - 1].name, e[i].name) >= 0) return "roots out of name order";
+    if (!RootsKindName(e[i].kind)) return "a root of no known kind";
+    if (!v.Holds(e[i].record, 4)) return "a root's record lies outside the region";
+  }
+  return nullptr;
+}
+
+// A handle around a record of the view, for the family checkers' helpers.
+CollectionHeader HandleAt(RegionView v, PoolOffset off) {
+  CollectionHeader h;
+  std::memset(&h, 0, sizeof h);
+  h.mp.base = const_cast<char *>(v.base);
+  h.data = const_cast<char *>(v.base) + off;
+  return h;
+}
+
+const char *ArrayFault(RegionView v, PoolOffset off) {
+  const EsaArrayData *d = v.At<EsaArrayData>(off);
+  if (d->size < 0 || d->size > d->capacity) return "size outside 0 .. capacity";
+  if (d->capacity > 0 && !v.Holds(d->entries, uint64_t{sizeof(EsaEntry)} * d->capacity))
+    return "entry block outside the region";
+  return nullptr;
+}
+
+const char *RbtFault(RegionView v, PoolOffset off) {
+  const RbtTreeData *d = v.At<RbtTreeData>(off);
+  if (!v.Holds(d->nil, sizeof(RbtNode))) return "sentinel outside the region";
+  if (d->root != d->nil && !v.Holds(d->root, sizeof(RbtNode))) return "root outside the region";
+  CollectionHeader h = HandleAt(v, off);
+  if (!RBTSentinelSound(RbtCtx(&h))) return "sentinel changed";
+  return nullptr;
+}
+
+const char *HstFault(RegionView v, PoolOffset off) {
+  const HstTreeData *d = v.At<HstTreeData>(off);
+  if (d->size < 1) return "size below 1";
+  if (!v.Holds(d->root, sizeof(HstNode))) return "root outside the region";
+  const HstNode *root = v.At<HstNode>(d->root);
+  if (root->parent != 0 || root->key < sizeof(ShRegionHeader) || root->key >= v.limit ||
+      v.base[root->key] != '\0')
+    return "root with a parent or a name";
+  return nullptr;
+}
+
+}  // namespace
+
+RegionView ViewOfPool(const MemPool *pool) {
+  const auto *h = static_cast<const ShRegionHeader *>(pool->base);
+  return RegionView{static_cast<const char *>(pool->base), h ? h->regionSize : 0};
+}
+
+RegionView ViewOfImage(const void *image, size_t mapped) {
+  const auto *h = static_cast<const ShRegionHeader *>(image);
+  uint32_t limit = mapped < sizeof *h ? 0 : h->regionSize;
+  if (limit > mapped) limit = static_cast<uint32_t>(mapped);
+  return RegionView{static_cast<const char *>(image), limit};
+}
+
+const RootsDirectory *RootsFindDirectory(RegionView v, const char **why) {
+  const char *fault = nullptr;
+  const RootsDirectory *dir = nullptr;
+  if (v.limit < sizeof(ShRegionHeader) ||
+      v.At<ShRegionHeader>(0)->reserved[0] != ROOTS_REGION_MAGIC) {
+    fault = "no directory";
+  } else {
+    const PoolOffset off = v.At<ShRegionHeader>(0)->reserved[1];
+    dir = v.At<RootsDirectory>(off);
+    if (!v.Holds(off, sizeof *dir))
+      fault = "directory outside the region";
+    else if (dir->magic != ROOTS_DIRECTORY_MAGIC || dir->self != off)
+      fault = "directory record damaged";
+    else if (dir->count < 0 || dir->count > dir->capacity ||
+             (dir->capacity > 0 && !v.Holds(dir->entries, uint64_t{sizeof(RootsEntry)} * dir->capacity)))
+      fault = "directory sizes damaged";
+    else if (AllocatedCapacity(v, off) < sizeof *dir ||
+             (dir->capacity > 0 && AllocatedCapacity(v, dir->entries) <
+                                       uint64_t{sizeof(RootsEntry)} * dir->capacity))
+      fault = "directory not in an allocated block (left from before a format?)";
+    else
+      fault = EntriesFault(v, dir);
+  }
+  if (why) *why = fault;
+  return fault ? nullptr : dir;
+}
+
+bool RootsSearch(RegionView v, const RootsDirectory *dir, const char *name, int32_t *at) {
+  const RootsEntry *e = RootsEntries(v, dir);
+  int32_t lo = 0, hi = dir->count;
+  while (lo < hi) {
+    const int32_t mid = lo + (hi - lo) / 2;
+    if (std::strcmp(e[mid].name, name) < 0)
+      lo = mid + 1;
+    else
+      hi = mid;
+  }
+  *at = lo;
+  return lo < dir->count && std::strcmp(e[lo].name, name) == 0;
+}
+
+const char *RootsRecordFault(RegionView v, uint32_t kind, PoolOffset off) {
+  static const uint32_t kBytes[] = {0, sizeof(EsaArrayData), sizeof(RbtTreeData), sizeof(RbtTreeData),
+                                    sizeof(RbtTreeData), sizeof(HstTreeData)};
+  if (!RootsKindName(kind)) return "no such kind";
+  if (!LooksAllocated(v, off, kBytes[kind])) return "not the payload of an allocated block";
+  if (kind == ROOTS_KIND_ARRAY) return ArrayFault(v, off);
+  if (kind == ROOTS_KIND_HST) return HstFault(v, off);
+  return RbtFault(v, off);
+}
+
+namespace {
+const char *const kKindNames[] = {nullptr, "array", "rbt", "rbt-int32", "rbt-voidptr", "hst"};
+}
+
+const char *RootsKindName(uint32_t kind) { return kind >= 1 && kind <= 5 ? kKindNames[kind] : nullptr; }
+
+uint32_t RootsKindNamed(const char *name) {
+  for (uint32_t k = 1; k <= 5; k++)
+    if (std::strcmp(kKindNames[k], name) == 0) return k;
+  return 0;
+}
+
+}  // namespace coffer
