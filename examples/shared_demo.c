@@ -1,13 +1,18 @@
-/* Containers shared by processes.
+/* Containers shared by processes, found by name.
  *
  * The parent creates a shared memory object, formats it as a heap region
- * under a process-shared lock kept in the object, and builds three
- * containers there: an associative array with an array template, a
- * red-black tree and a sorted string array. Worker processes then map the
- * object at addresses of their own, attach a pool with size 0 and change the
- * containers concurrently, each container call under a lock of the demo's
+ * under a process-shared lock kept in the object, gives the region a
+ * directory of named roots and builds three containers there under names:
+ * an associative array with an array template, a red-black tree and a
+ * sorted string array. Worker processes then map the object at addresses of
+ * their own, attach a pool with size 0, open each container by its name and
+ * change them concurrently, each container call under a lock of the demo's
  * own (the containers take none). Last, the parent checks every container
- * and the heap, frees everything and checks that the region is whole again. */
+ * and the heap, and shows in a private copy of the region that freeing every
+ * container leaves it whole. The object stays, for coffer-inspect:
+ *
+ *   shared_demo [NAME]        (NAME defaults to /coffer-demo)
+ *   coffer-inspect stats --shm NAME --offset 64 */
 #define _GNU_SOURCE
 #include <coffer/coffer.h>
 #include <coffer/platform.h>
@@ -22,13 +27,11 @@
 
 enum { WORKERS = 4, ITEMS = 250, REGION_SIZE = 4 << 20, LIMIT = 100 };
 
-/* The head of the shared object: two locks and where the containers'
- * records are. The heap region follows it. Only offsets are kept here, since
- * every process maps the object at its own address. */
+/* The head of the shared object: two locks. The heap region follows it;
+ * everything else is found in the region, by name. */
 typedef struct Shared {
   TandelExclLock heapLock; /* held by the pool for one allocator call */
   TandelExclLock demoLock; /* held by the demo around each container call */
-  PoolOffset hstData, rbtData, esaData;
 } Shared;
 
 #define REGION(sh) ((void *)((char *)(sh) + sizeof(Shared)))
@@ -60,21 +63,21 @@ typedef struct Handles {
   EsaArray esa;
 } Handles;
 
-static void *At(MemPool *pool, PoolOffset off) { return (char *)pool->base + off; }
-static PoolOffset Off(MemPool *pool, void *p) { return (PoolOffset)((char *)p - (char *)pool->base); }
-
-static void MakeHandles(Handles *h, Shared *sh) {
-  memset(h, 0, sizeof *h);
-  MemPool_InitOnSharedHeap(&h->pool, REGION(sh), 0, &sh->heapLock); /* attach */
-  h->aa.hst.mp = h->pool;
-  h->aa.hst.data = At(&h->pool, sh->hstData);
+/* Opens every container by its name in the region that pool runs. */
+static bool OpenHandles(Handles *h) {
+  if (!HST_OpenNamedTree(&h->aa.hst, &h->pool, "workers") ||
+      !RBT_OpenNamedTree(&h->rbt, &h->pool, "even-items") ||
+      !ESA_OpenNamedArray(&h->esa, &h->pool, "all-items"))
+    return false;
   h->aa.cloneValFn = CopyVal;
   h->aa.insertValFn = AddVal;
   h->aa.removeValFn = SubVal;
-  h->rbt.mp = h->pool;
-  h->rbt.data = At(&h->pool, sh->rbtData);
-  h->esa.mp = h->pool;
-  h->esa.data = At(&h->pool, sh->esaData);
+  return true;
+}
+
+static bool AttachHandles(Handles *h, Shared *sh) {
+  MemPool_InitOnSharedHeap(&h->pool, REGION(sh), 0, &sh->heapLock); /* attach */
+  return OpenHandles(h);
 }
 
 static Shared *MapObject(int fd, size_t size) {
@@ -94,7 +97,10 @@ static void Worker(int fd, size_t size, Shared *inherited, int w) {
   char path[64], key[32];
   int i;
   munmap(inherited, size);
-  MakeHandles(&h, sh);
+  if (!AttachHandles(&h, sh)) {
+    printf("worker %d: the containers are not found by name\n", w);
+    _exit(1);
+  }
   printf("worker %d: region mapped at %p\n", w, REGION(sh));
   fflush(stdout);
   for (i = 0; i < ITEMS; i++) {
@@ -153,39 +159,71 @@ static int Fail(const char *what) {
   return 1;
 }
 
-int main(void) {
-  char name[64];
+/* Builds the three containers and names them. From then on every process,
+ * this one included, reaches them by name, so the handles made with them
+ * are released at once (a container's handle is a block of the pool). */
+static bool MakeContainers(MemPool *pool) {
+  HstTree *hst = HST_AllocTreeEx(pool, '/', 0, 4, 4);
+  RbtTree *rbt = RBT_AllocTreeEx(pool);
+  EsaArray *esa = ESA_AllocArrayEx(pool, 16, 64);
+  bool named = hst && rbt && esa && Roots_Set(pool, "workers", ROOTS_KIND_HST, hst) &&
+               Roots_Set(pool, "even-items", ROOTS_KIND_RBT, rbt) &&
+               Roots_Set(pool, "all-items", ROOTS_KIND_ARRAY, esa);
+  pool->free(pool, hst);
+  pool->free(pool, rbt);
+  pool->free(pool, esa);
+  return named;
+}
+
+/* In a private copy of the region, at yet another address: open every
+ * container by name, free it and the directory; the copy must then be one
+ * free block. Returns the number of failures. */
+static int FreeInCopy(void *region) {
+  Handles c;
+  int blocks, freeBlocks, errors = 0;
+  void *copy = malloc(REGION_SIZE);
+  if (!copy) return Fail("memory for the copy");
+  memcpy(copy, region, REGION_SIZE);
+  MemPool_InitOnSimpleHeap(&c.pool, copy, 0);
+  if (!OpenHandles(&c)) {
+    free(copy);
+    return Fail("containers found by name in the copy");
+  }
+  HST_FreeTree(&c.aa.hst);
+  RBT_FreeTree(&c.rbt);
+  ESA_FreeArray(&c.esa);
+  Roots_DestroyDirectory(&c.pool);
+  blocks = CheckHeap(copy, &freeBlocks);
+  if (blocks != 1 || freeBlocks != 1) errors += Fail("region whole again after freeing");
+  printf("parent: in a copy, freeing every container leaves %s\n",
+         blocks == 1 ? "one free block again" : "NOT a whole region");
+  free(copy);
+  return errors;
+}
+
+int main(int argc, char **argv) {
+  const char *name = argc > 1 ? argv[1] : "/coffer-demo";
   size_t size = sizeof(Shared) + REGION_SIZE;
   Shared *sh;
   Handles h;
-  HstTree *hst;
-  RbtTree *rbt;
-  EsaArray *esa;
   HstNode *root;
   int fd, w, i, status, blocks, freeBlocks, errors = 0;
   pid_t pids[WORKERS];
 
-  snprintf(name, sizeof name, "/coffer-demo-%d", (int)getpid());
-  fd = shm_open(name, O_RDWR | O_CREAT | O_EXCL, 0600);
+  /* The object outlives the demo, so that coffer-inspect can read it. */
+  fd = shm_open(name, O_RDWR | O_CREAT | O_TRUNC, 0600);
   if (fd < 0 || ftruncate(fd, (off_t)size) != 0) {
-    perror("shared memory object");
+    perror(name);
     return 1;
   }
-  shm_unlink(name); /* the open descriptor keeps it alive for the workers */
   sh = MapObject(fd, size);
   Tandel_InitExclLock(&sh->heapLock);
   Tandel_InitExclLock(&sh->demoLock);
 
-  /* Format the region and build the containers in it. */
+  /* Format the region, give it a directory and build the containers. */
   MemPool_InitOnSharedHeap(&h.pool, REGION(sh), REGION_SIZE, &sh->heapLock);
-  hst = HST_AllocTreeEx(&h.pool, '/', 0, 4, 4);
-  rbt = RBT_AllocTreeEx(&h.pool);
-  esa = ESA_AllocArrayEx(&h.pool, 16, 64);
-  if (!hst || !rbt || !esa) return Fail("creating the containers");
-  sh->hstData = Off(&h.pool, hst->data);
-  sh->rbtData = Off(&h.pool, rbt->data);
-  sh->esaData = Off(&h.pool, esa->data);
-  MakeHandles(&h, sh);
+  if (!Roots_CreateDirectory(&h.pool) || !MakeContainers(&h.pool) || !OpenHandles(&h))
+    return Fail("creating and naming the containers");
   /* The array template: every worker's element starts as a copy of it. */
   HSTAA_Insert(&h.aa, "/workers/#/limit", LIMIT);
   printf("parent: region of %d bytes at %p, template /workers/#/limit = %d\n", REGION_SIZE,
@@ -233,18 +271,12 @@ int main(void) {
          WORKERS, (int)RBT_GetSize(&h.rbt), (int)ESA_GetSize(&h.esa),
          (int)HSTAA_GetSubtreeValCount(&h.aa, root), blocks, freeBlocks);
 
-  /* Free everything: the region must be one free block again. */
-  HST_FreeTree(hst);
-  RBT_FreeTree(rbt);
-  ESA_FreeArray(esa);
-  blocks = CheckHeap(REGION(sh), &freeBlocks);
-  if (blocks != 1 || freeBlocks != 1) errors += Fail("region whole again after freeing");
-  printf("parent: after freeing every container the region is %s\n",
-         blocks == 1 ? "one free block again" : "NOT whole");
-  Tandel_DestroyExclLock(&sh->demoLock);
-  Tandel_DestroyExclLock(&sh->heapLock);
+  errors += FreeInCopy(REGION(sh));
   munmap(sh, size);
   close(fd);
+  printf("parent: the region stays in the shared memory object %s, %u bytes in: try\n"
+         "  coffer-inspect stats --shm %s --offset %u\n",
+         name, (unsigned)sizeof(Shared), name, (unsigned)sizeof(Shared));
   printf(errors ? "demo FAILED\n" : "demo OK\n");
   return errors ? 1 : 0;
 }

@@ -105,6 +105,29 @@ const char *HstFault(RegionView v, PoolOffset off) {
   return nullptr;
 }
 
+// The checks run in two groups. Until the record is known to be an allocated
+// block with the directory's magic and its own offset, failing words are
+// taken for words left from before a format (stale); past that, for damage.
+const char *DirectoryFault(RegionView v, const RootsDirectory **out, bool *stale) {
+  *stale = true;
+  if (v.limit < sizeof(ShRegionHeader) || v.At<ShRegionHeader>(0)->reserved[0] != ROOTS_REGION_MAGIC)
+    return "no directory";
+  const PoolOffset off = v.At<ShRegionHeader>(0)->reserved[1];
+  const RootsDirectory *dir = v.At<RootsDirectory>(off);
+  if (!v.Holds(off, sizeof *dir)) return "directory outside the region";
+  if (AllocatedCapacity(v, off) < sizeof *dir)
+    return "directory not in an allocated block (left from before a format?)";
+  if (dir->magic != ROOTS_DIRECTORY_MAGIC || dir->self != off) return "no directory record there";
+  *stale = false;
+  const uint64_t bytes = uint64_t{sizeof(RootsEntry)} * static_cast<uint32_t>(dir->capacity);
+  if (dir->count < 0 || dir->count > dir->capacity || (dir->capacity > 0 && !v.Holds(dir->entries, bytes)))
+    return "directory sizes damaged";
+  if (dir->capacity > 0 && AllocatedCapacity(v, dir->entries) < bytes)
+    return "directory entries not in an allocated block";
+  *out = dir;
+  return EntriesFault(v, dir);
+}
+
 }  // namespace
 
 RegionView ViewOfPool(const MemPool *pool) {
@@ -119,30 +142,12 @@ RegionView ViewOfImage(const void *image, size_t mapped) {
   return RegionView{static_cast<const char *>(image), limit};
 }
 
-const RootsDirectory *RootsFindDirectory(RegionView v, const char **why) {
-  const char *fault = nullptr;
+const RootsDirectory *RootsFindDirectory(RegionView v, const char **why, bool *stale) {
   const RootsDirectory *dir = nullptr;
-  if (v.limit < sizeof(ShRegionHeader) ||
-      v.At<ShRegionHeader>(0)->reserved[0] != ROOTS_REGION_MAGIC) {
-    fault = "no directory";
-  } else {
-    const PoolOffset off = v.At<ShRegionHeader>(0)->reserved[1];
-    dir = v.At<RootsDirectory>(off);
-    if (!v.Holds(off, sizeof *dir))
-      fault = "directory outside the region";
-    else if (dir->magic != ROOTS_DIRECTORY_MAGIC || dir->self != off)
-      fault = "directory record damaged";
-    else if (dir->count < 0 || dir->count > dir->capacity ||
-             (dir->capacity > 0 && !v.Holds(dir->entries, uint64_t{sizeof(RootsEntry)} * dir->capacity)))
-      fault = "directory sizes damaged";
-    else if (AllocatedCapacity(v, off) < sizeof *dir ||
-             (dir->capacity > 0 && AllocatedCapacity(v, dir->entries) <
-                                       uint64_t{sizeof(RootsEntry)} * dir->capacity))
-      fault = "directory not in an allocated block (left from before a format?)";
-    else
-      fault = EntriesFault(v, dir);
-  }
+  bool isStale;
+  const char *fault = DirectoryFault(v, &dir, &isStale);
   if (why) *why = fault;
+  if (stale) *stale = fault && isStale;
   return fault ? nullptr : dir;
 }
 

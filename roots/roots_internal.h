@@ -36,9 +36,11 @@ RegionView ViewOfPool(const MemPool *pool);
 RegionView ViewOfImage(const void *image, size_t mapped);
 
 // The region's directory, or null with the reason there is none that can be
-// trusted (see roots.h for what is checked). Reads block headers, so a caller
-// holds the heap's lock when other processes may allocate.
-const RootsDirectory *RootsFindDirectory(RegionView v, const char **why);
+// trusted (see roots.h for what is checked), and whether the words only lead
+// to no directory (stale: none was made, or it is left from before a format)
+// rather than to a damaged one. Reads block headers, so a caller holds the
+// heap's lock when other processes may allocate.
+const RootsDirectory *RootsFindDirectory(RegionView v, const char **why, bool *stale = nullptr);
 
 // The entries of a directory RootsFindDirectory returned.
 inline const RootsEntry *RootsEntries(RegionView v, const RootsDirectory *dir) {
