@@ -73,7 +73,7 @@ CollectionHeader HandleAt(RegionView v, PoolOffset off) {
   CollectionHeader h;
   std::memset(&h, 0, sizeof h);
   h.mp.base = const_cast<char *>(v.base);
-  h.data = const_cast<char *>(v.base) + off;
+  h.data = const_cast<RootsDirectory *>(v.At<RootsDirectory>(off));
   return h;
 }
 
@@ -100,7 +100,7 @@ const char *HstFault(RegionView v, PoolOffset off) {
   if (!v.Holds(d->root, sizeof(HstNode))) return "root outside the region";
   const HstNode *root = v.At<HstNode>(d->root);
   if (root->parent != 0 || root->key < sizeof(ShRegionHeader) || root->key >= v.limit ||
-      v.base[root->key] != '\0')
+      *v.At<char>(root->key) != 0)
     return "root with a parent or a name";
   return nullptr;
 }

@@ -17,9 +17,10 @@ struct RegionView {
   const char *base;
   uint32_t limit;
 
+  // The sum is formed on integers: an offset not yet checked may wrap.
   template <class T>
   const T *At(uint32_t off) const {
-    return reinterpret_cast<const T *>(base + off);
+    return reinterpret_cast<const T *>(reinterpret_cast<uintptr_t>(base) + off);
   }
   // bytes at off lie inside the region, past its header, 4-byte aligned.
   bool Holds(uint32_t off, uint64_t bytes) const {

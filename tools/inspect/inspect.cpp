@@ -75,7 +75,7 @@ CollectionHeader HandleAt(const Ctx &c, PoolOffset off) {
   CollectionHeader h;
   std::memset(&h, 0, sizeof h);
   h.mp.base = const_cast<void *>(c.image);
-  h.data = const_cast<char *>(c.view.base) + off;
+  h.data = const_cast<char *>(c.view.At<char>(off));
   return h;
 }
 
@@ -245,7 +245,7 @@ int Roots(Ctx &c) {
 
 // ---- dump -------------------------------------------------------------------------
 
-const char *Str(const Ctx &c, PoolOffset off) { return c.view.base + off; }
+const char *Str(const Ctx &c, PoolOffset off) { return c.view.At<char>(off); }
 
 void Value(Writer &w, CofferVal v) {
   if (w.json) return w.U("value", v);
