@@ -35,12 +35,16 @@ TEST(Esa, CheckerFindsEachDamage) {
   for (const char *k : {"a", "b", "c"}) ESA_Insert(a, k, 0);
   auto *d = static_cast<EsaArrayData *>(a->data);
   EsaEntry *e = ESA_Get(a, 0);
-  ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::ESACheckArray(a, f); },
+  coffer::CheckSpan span = {16, 1024};  // the region past its header
+  ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::ESACheckArray(a, f, &span); },
                   {{"size outside 0 .. capacity", [&] { d->size = 5; }},
                    {"size outside 0 .. capacity", [&] { d->size = -1; }},
                    {"slots without an entry block", [&] { d->entries = 0; }},
                    {"entry without a key", [&] { e[1].key = 0; }},
-                   {"keys out of order", [&] { std::swap(e[0], e[2]); }}});
+                   {"keys out of order", [&] { std::swap(e[0], e[2]); }},
+                   {"entry block outside the region", [&] { d->entries = 8; }},
+                   {"key outside the region", [&] { e[1].key = 8; }},
+                   {"record outside the region", [&] { span.hi = 16; }}});  // last: the span stays narrowed
 }
 
 }  // namespace

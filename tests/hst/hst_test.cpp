@@ -57,7 +57,8 @@ TEST(Hst, CheckerFindsEachDamage) {
   HstNode *a = HST_Find(t, "/a"), *b = HST_Find(t, "/a/b"), *root = HST_GetRoot(t);
   auto *data = static_cast<HstTreeData *>(t->data);
   auto *e = coffer::RecordAt<EsaEntry>(t, coffer::RecordAt<EsaArrayData>(t, a->children)->entries);
-  ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::hst::HSTCheckTree(t, true, f); },
+  coffer::CheckSpan span = {16, 4096};  // the region past its header
+  ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::hst::HSTCheckTree(t, true, f, &span); },
                   {{"root missing, named or with a parent", [&] { root->parent = a->parent; }},
                    {"node without a name", [&] { b->key = 0; }},
                    {"keys out of order", [&] { std::swap(e[0], e[1]); }},
@@ -67,7 +68,10 @@ TEST(Hst, CheckerFindsEachDamage) {
                    {"more nodes than size counts", [&] { data->size = 2; }},
                    {"size differs from the nodes reachable", [&] { data->size = 9; }},
                    {"negative value count", [&] { b->subtreeValCount = -1; }},
-                   {"value count below its children's", [&] { b->subtreeValCount = 1; }}});
+                   {"value count below its children's", [&] { b->subtreeValCount = 1; }},
+                   {"node outside the region", [&] { e[1].val = 8; }},
+                   {"key outside the region", [&] { b->key = 8; }},
+                   {"record outside the region", [&] { span.hi = 16; }}});  // last: the span stays narrowed
 }
 
 }  // namespace

@@ -63,7 +63,16 @@ TEST(Rbt, CheckerFindsEachDamage) {
   for (int32_t k : {4, 2, 6, 1, 3, 5, 7, 8}) RbtInt32_Insert(t, k, 0);
   auto *d = static_cast<RbtTreeData *>(t->data);
   auto node = [&](int32_t k) { return RbtInt32_Find(t, k); };
-  ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::RBTCheckTree(t, coffer::kRbtInt32Keys, f); },
+  coffer::CheckSpan span = {16, 4096};  // the region past its header
+  auto chain = [&] {  // black nodes 1 .. 8, each the right child of the one before
+    RbtNode *n[10] = {};
+    for (int32_t k = 1; k <= 8; k++) n[k] = node(k);
+    for (int32_t k = 1; k <= 8; k++)
+      n[k]->parent = k > 1 ? coffer::OffsetOf(t, n[k - 1]) : d->nil, n[k]->left = d->nil,
+      n[k]->right = k < 8 ? coffer::OffsetOf(t, n[k + 1]) : d->nil, n[k]->color = 0;
+    d->root = coffer::OffsetOf(t, n[1]);
+  };
+  ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::RBTCheckTree(t, coffer::kRbtInt32Keys, f, &span); },
                   {{"sentinel changed", [&] { coffer::RecordAt<RbtNode>(t, d->nil)->color = 1; }},
                    {"red root", [&] { node(4)->color = 1; }},
                    {"red node with a red child", [&] { node(7)->color = 1; }},
@@ -73,7 +82,11 @@ TEST(Rbt, CheckerFindsEachDamage) {
                    {"keys out of order", [&] { node(3)->key = 9; }},
                    {"more nodes than size counts", [&] { d->size = 2; }},
                    {"size differs from the nodes reachable", [&] { d->size = 9; }},
-                   {"a link is 0 instead of the sentinel", [&] { node(8)->left = 0; }}});
+                   {"a link is 0 instead of the sentinel", [&] { node(8)->left = 0; }},
+                   {"deeper than its size allows", chain},
+                   {"sentinel outside the region", [&] { d->nil = 8; }},
+                   {"node outside the region", [&] { node(7)->right = 8; }},
+                   {"record outside the region", [&] { span.hi = 16; }}});  // last: the span stays narrowed
 }
 
 }  // namespace

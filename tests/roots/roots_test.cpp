@@ -1,6 +1,6 @@
 // Named roots: the directory against a model, read again from a copy of the
-// region at another address; the directories it must refuse; and refused
-// pool calls during creation and change.
+// region at another address; the directories and records it must refuse;
+// and refused pool calls during creation and change.
 #include <coffer/roots.h>
 #include <gtest/gtest.h>
 
@@ -8,33 +8,12 @@
 #include <functional>
 #include <map>
 
-#include "mempool/pool.h"
 #include "mempool/region_heap.h"
+#include "roots/region.h"
 #include "support/driver.h"
 
 namespace coffer_test {
 namespace {
-
-constexpr uint32_t kSize = 1 << 16;
-
-// A formatted region holding one container of each kind (two entries each).
-struct Region {
-  std::vector<uint32_t> words = std::vector<uint32_t>(kSize / 4, 0xA5A5A5A5u);
-  MemPool pool;
-  CollectionHeader *c[5];
-  Region() {
-    MemPool_InitOnSimpleHeap(&pool, words.data(), kSize);
-    c[0] = ESA_AllocArrayEx(&pool, 2, 2), c[1] = RBT_AllocTreeEx(&pool);
-    c[2] = RbtInt32_AllocTreeEx(&pool), c[3] = RbtVoidPtr_AllocTreeEx(&pool);
-    c[4] = HST_AllocTreeEx(&pool, '/', 0, 1, 1);
-    for (const char *k : {"x", "y"}) {
-      ESA_Insert(c[0], k, 1), RBT_Insert(c[1], k, 2), RbtInt32_Insert(c[2], k[0], 3);
-      RbtVoidPtr_Insert(c[3], k, 4), HST_Insert(c[4], k[0] == 'x' ? "/x" : "/x/y", 5);
-    }
-  }
-  ShRegionHeader *head() { return reinterpret_cast<ShRegionHeader *>(words.data()); }
-  uint32_t &word(uint32_t off) { return words[off / 4]; }
-};
 
 using Model = std::map<std::string, std::pair<int32_t, PoolOffset>>;
 
@@ -50,16 +29,17 @@ std::string Compare(MemPool *pool, const Model &m) {
   return Roots_GetAt(pool, i, &name, &kind, &rec) ? "an entry past the count" : "";
 }
 
-// Opens each root by name with its family's call, in the region at pool,
-// and reads the container's size through the handle.
+// Opens a root by name with the family's call for kind and reads the size
+// through the handle; -1 when the open is refused.
 int32_t OpenedSize(MemPool *pool, const std::string &name, int32_t kind) {
   CollectionHeader h;
+  const char *n = name.c_str();
   switch (kind) {
-    case ROOTS_KIND_ARRAY: return ESA_OpenNamedArray(&h, pool, name.c_str()) ? ESA_GetSize(&h) : -1;
-    case ROOTS_KIND_RBT: return RBT_OpenNamedTree(&h, pool, name.c_str()) ? RBT_GetSize(&h) : -1;
-    case ROOTS_KIND_RBT_INT32: return RbtInt32_OpenNamedTree(&h, pool, name.c_str()) ? RbtInt32_GetSize(&h) : -1;
-    case ROOTS_KIND_RBT_VOIDPTR: return RbtVoidPtr_OpenNamedTree(&h, pool, name.c_str()) ? RbtVoidPtr_GetSize(&h) : -1;
-    default: return HST_OpenNamedTree(&h, pool, name.c_str()) ? HST_GetSize(&h) : -1;
+    case ROOTS_KIND_ARRAY: return ESA_OpenNamedArray(&h, pool, n) ? ESA_GetSize(&h) : -1;
+    case ROOTS_KIND_RBT: return RBT_OpenNamedTree(&h, pool, n) ? RBT_GetSize(&h) : -1;
+    case ROOTS_KIND_RBT_INT32: return RbtInt32_OpenNamedTree(&h, pool, n) ? RbtInt32_GetSize(&h) : -1;
+    case ROOTS_KIND_RBT_VOIDPTR: return RbtVoidPtr_OpenNamedTree(&h, pool, n) ? RbtVoidPtr_GetSize(&h) : -1;
+    default: return HST_OpenNamedTree(&h, pool, n) ? HST_GetSize(&h) : -1;
   }
 }
 
@@ -69,8 +49,7 @@ TEST(Roots, DirectoryAgreesWithItsModelInEveryMapping) {
     ASSERT_EQ(Roots_GetCount(&r.pool), -1);
     ASSERT_TRUE(Roots_CreateDirectory(&r.pool) && Roots_CreateDirectory(&r.pool));
     Model m;
-    Ops ops(RandomBytes(seed, 600));
-    while (ops.More()) {
+    for (Ops ops(RandomBytes(seed, 600)); ops.More();) {
       std::string name = ops.Key("abc", 3);
       if (ops.Take(16) == 0) name.append(36 + ops.Take(2), 'x');  // 39 bytes fit, 40 do not
       const int32_t kind = 1 + ops.Take(5);
@@ -79,7 +58,7 @@ TEST(Roots, DirectoryAgreesWithItsModelInEveryMapping) {
         EXPECT_EQ(Roots_Remove(&r.pool, name.c_str()), m.erase(name) == 1);
       } else {
         EXPECT_EQ(Roots_Set(&r.pool, name.c_str(), kind, r.c[kind - 1]), usable);
-        if (usable) m[name] = {kind, coffer::AddrToOffset(&r.pool, r.c[kind - 1]->data)};
+        if (usable) m[name] = {kind, r.rec(kind - 1)};
       }
       ASSERT_EQ(Compare(&r.pool, m), "") << "seed " << seed;
     }
@@ -89,64 +68,62 @@ TEST(Roots, DirectoryAgreesWithItsModelInEveryMapping) {
     MemPool_InitOnSimpleHeap(&copy.pool, copy.words.data(), 0);
     EXPECT_EQ(Compare(&copy.pool, m), "");
     for (const auto &[name, entry] : m) {
-      EXPECT_EQ(OpenedSize(&copy.pool, name, entry.first), entry.first == ROOTS_KIND_HST ? 3 : 2) << name;
-      EXPECT_EQ(OpenedSize(&copy.pool, name, entry.first % 5 + 1), -1) << name;  // another family
+      EXPECT_EQ(OpenedSize(&copy.pool, name, entry.first), entry.first == ROOTS_KIND_HST ? 3 : 2);
+      EXPECT_EQ(OpenedSize(&copy.pool, name, entry.first % 5 + 1), -1);  // as another family
     }
   }
 }
 
-// Each row leaves bytes that must not be taken for a directory (or, for the
-// last rows, for a container): the directory and its two roots are refused.
+// Formats the region again and allocates n small blocks.
+void Format(Region &r, int n) {
+  SH_Reset(r.words.data(), kSize);
+  while (n--) SH_Alloc(r.words.data(), 8);
+}
+
+// Each row leaves bytes that must not be taken for a directory: reserved
+// words d (offset) and the entry block at e as the directory left them.
+#define ROW(what, body) {what, [](Region &r, uint32_t d, uint32_t e) { (void)d, (void)e, body; }}
 TEST(Roots, StaleOrDamagedDirectoriesAreRefused) {
   const struct {
     const char *what;
-    std::function<void(Region &, uint32_t dir, uint32_t entries)> damage;
+    void (*damage)(Region &, uint32_t, uint32_t);
   } kRows[] = {
-      {"no magic", [](Region &r, uint32_t, uint32_t) { r.head()->reserved[0] = 0; }},
-      {"formatted again", [](Region &r, uint32_t, uint32_t) { SH_Reset(r.words.data(), kSize); }},
-      {"formatted, then cut up", [](Region &r, uint32_t, uint32_t) {
-         SH_Reset(r.words.data(), kSize);
-         for (int i = 0; i < 200; i++) SH_Alloc(r.words.data(), 8);
-       }},
-      {"formatted, same block rewritten", [](Region &r, uint32_t dir, uint32_t) {
-         SH_Reset(r.words.data(), kSize);
-         SH_Alloc(r.words.data(), dir - 48);
-         EXPECT_EQ(SH_Alloc(r.words.data(), sizeof(RootsDirectory)), &r.word(dir));
-         r.word(dir) = 0;
-       }},
-      {"offset past the region", [](Region &r, uint32_t, uint32_t) { r.head()->reserved[1] = kSize - 8; }},
-      {"offset in the header", [](Region &r, uint32_t, uint32_t) { r.head()->reserved[1] = 8; }},
-      {"offset unaligned", [](Region &r, uint32_t, uint32_t) { r.head()->reserved[1] += 2; }},
-      {"own offset wrong", [](Region &r, uint32_t dir, uint32_t) { r.word(dir + 4) += 4; }},
-      {"count past capacity", [](Region &r, uint32_t dir, uint32_t) { r.word(dir + 12) = 5; }},
-      {"entries outside", [](Region &r, uint32_t dir, uint32_t) { r.word(dir + 8) = kSize - 16; }},
-      {"names out of order", [](Region &r, uint32_t, uint32_t e) { std::swap(r.word(e), r.word(e + 48)); }},
-      {"name unterminated", [](Region &r, uint32_t, uint32_t e) { std::fill_n(&r.word(e), 10, 0x41414141); }},
-      {"unknown kind", [](Region &r, uint32_t, uint32_t e) { r.word(e + 40) = 9; }},
-      {"record outside", [](Region &r, uint32_t, uint32_t e) { r.word(e + 44) = kSize; }},
+      ROW("no magic", r.word(8) = 0),
+      ROW("formatted again", Format(r, 0)),
+      ROW("formatted, cut up", Format(r, 200)),
+      ROW("formatted, same block rewritten", (Format(r, 0), SH_Alloc(r.words.data(), d - 48),
+                                              *static_cast<uint32_t *>(SH_Alloc(r.words.data(), 20)) = 0)),
+      ROW("offset past the region", r.word(12) = kSize - 8),
+      ROW("offset in the header", r.word(12) = 8),
+      ROW("offset unaligned", r.word(12) += 2),
+      ROW("own offset wrong", r.word(d + 4) += 4),
+      ROW("count past capacity", r.word(d + 12) = 5),
+      ROW("entries outside", r.word(d + 8) = kSize - 16),
+      ROW("names out of order", std::swap(r.word(e), r.word(e + 48))),
+      ROW("name unterminated", std::fill_n(&r.word(e), 10, 0x41414141)),
+      ROW("unknown kind", r.word(e + 40) = 9),
+      ROW("record outside", r.word(e + 44) = kSize),
   };
   for (const auto &row : kRows) {
     Region r;
     ASSERT_TRUE(Roots_CreateDirectory(&r.pool));
     ASSERT_TRUE(Roots_Set(&r.pool, "a", ROOTS_KIND_ARRAY, r.c[0]) && Roots_Set(&r.pool, "b", ROOTS_KIND_HST, r.c[4]));
-    const uint32_t dir = r.head()->reserved[1], entries = r.word(dir + 8);
-    row.damage(r, dir, entries);
+    row.damage(r, r.word(12), r.word(r.word(12) + 8));
     EXPECT_EQ(Roots_GetCount(&r.pool), -1) << row.what;
     EXPECT_FALSE(Roots_Get(&r.pool, "a", nullptr, nullptr)) << row.what;
     EXPECT_EQ(OpenedSize(&r.pool, "b", ROOTS_KIND_HST), -1) << row.what;
   }
-  // Records that cannot be opened, though the directory is sound.
+  // Records that cannot be opened as what they are asked to be.
   Region r;
   CollectionHeader h;
-  auto rec = [&](int i) { return coffer::AddrToOffset(&r.pool, r.c[i]->data); };
-  EXPECT_FALSE(ESA_OpenArray(&h, &r.pool, rec(0) + 4));                      // not a block's payload
-  EXPECT_FALSE(HST_OpenTree(&h, &r.pool, rec(0)));                          // block too small
-  EXPECT_FALSE(RBT_OpenTree(&h, &r.pool, rec(0)));                          // no sentinel there
-  static_cast<RbtTreeData *>(r.c[1]->data)->nil = rec(0);                   // a sentinel of no tree
-  EXPECT_FALSE(RBT_OpenTree(&h, &r.pool, rec(1)));
+  EXPECT_FALSE(ESA_OpenArray(&h, &r.pool, r.rec(0) + 4));  // not a block's payload
+  EXPECT_FALSE(HST_OpenTree(&h, &r.pool, r.rec(0)));       // block too small
+  EXPECT_FALSE(RBT_OpenTree(&h, &r.pool, r.rec(0)));       // no sentinel there
+  static_cast<RbtTreeData *>(r.c[1]->data)->nil = r.rec(0);
+  EXPECT_FALSE(RBT_OpenTree(&h, &r.pool, r.rec(1)));  // a sentinel of no tree
   static_cast<HstTreeData *>(r.c[4]->data)->size = 0;
-  EXPECT_FALSE(HST_OpenTree(&h, &r.pool, rec(4)));
-  EXPECT_TRUE(RbtInt32_OpenTree(&h, &r.pool, rec(2)) && h.data == r.c[2]->data && !h.ownsHandle);
+  EXPECT_FALSE(HST_OpenTree(&h, &r.pool, r.rec(4)));
+  EXPECT_TRUE(RbtInt32_OpenTree(&h, &r.pool, r.rec(2)) && h.data == r.c[2]->data && !h.ownsHandle);
 }
 
 // A pool over a region whose allocation calls the failure-injection
@@ -156,37 +133,35 @@ bool Counted() {
   void *probe = g_counter->pool()->alloc(g_counter->pool(), 0);
   return probe && (g_counter->pool()->free(g_counter->pool(), probe), true);
 }
-MemPool CountedPool(void *region) {
-  return MemPool{[](MemPool *p, size_t n) { return Counted() ? SH_Alloc(p->base, n) : nullptr; },
-                 [](MemPool *p, size_t k, size_t n) -> void * {
-                   void *b = Counted() ? SH_Alloc(p->base, k * n) : nullptr;
-                   return b ? std::memset(b, 0, k * n) : nullptr;
-                 },
-                 [](MemPool *p, void *b, size_t n) { return Counted() ? SH_Realloc(p->base, b, n) : nullptr; },
-                 [](MemPool *p, void *b) { SH_Free(p->base, b); }, region, nullptr};
-}
+const MemPool kCounted = {
+    [](MemPool *p, size_t n) { return Counted() ? SH_Alloc(p->base, n) : nullptr; },
+    [](MemPool *p, size_t k, size_t n) -> void * {
+      void *b = Counted() ? SH_Alloc(p->base, k * n) : nullptr;
+      return b ? std::memset(b, 0, k * n) : nullptr;
+    },
+    [](MemPool *p, void *b, size_t n) { return Counted() ? SH_Realloc(p->base, b, n) : nullptr; },
+    [](MemPool *p, void *b) { SH_Free(p->base, b); }, nullptr, nullptr};
 
 TEST(Roots, RefusedPoolCallsLeaveTheDirectoryAsItWas) {
   EXPECT_EQ(ForEachFailure([](Arena arena) -> std::string {
               Region r;
-              g_counter = arena.tp;
-              MemPool pool = CountedPool(r.words.data());
+              MemPool pool = kCounted;
+              pool.base = r.words.data(), g_counter = arena.tp;
               coffer::ShHeapCounts before, after;
               Model m;
-              for (int i = 0; i < 7; i++) {
-                coffer::SHCheckHeap(r.words.data(), &before, static_cast<std::string *>(nullptr));
+              for (int i = 0; i < 7; i++) {  // create, then six roots: the entry block grows twice
                 const std::string name(1, static_cast<char>('a' + i));
-                const bool done = i == 0 ? Roots_CreateDirectory(&pool)
-                                         : Roots_Set(&pool, name.c_str(), ROOTS_KIND_RBT, r.c[1]);
-                coffer::SHCheckHeap(r.words.data(), &after, static_cast<std::string *>(nullptr));
-                if (i > 0 && done) m[name] = {ROOTS_KIND_RBT, coffer::AddrToOffset(&pool, r.c[1]->data)};
-                if (done) MODEL_TRY(Compare(&pool, m));
-                MODEL_EXPECT(done || Roots_GetCount(&pool) == (i == 0 ? -1 : static_cast<int32_t>(m.size())));
-                MODEL_EXPECT(done || after.allocatedBlocks == before.allocatedBlocks);
-                if (!done) return "";
+                coffer::SHCheckHeap(r.words.data(), &before, static_cast<std::string *>(nullptr));
+                if (!(i ? Roots_Set(&pool, name.c_str(), ROOTS_KIND_RBT, r.c[1]) : Roots_CreateDirectory(&pool))) {
+                  coffer::SHCheckHeap(r.words.data(), &after, static_cast<std::string *>(nullptr));
+                  MODEL_EXPECT(after.allocatedBlocks == before.allocatedBlocks);
+                  return i ? Compare(&pool, m) : Roots_GetCount(&pool) == -1 ? "" : "a directory";
+                }
+                if (i) m[name] = {ROOTS_KIND_RBT, r.rec(1)};
+                MODEL_TRY(Compare(&pool, m));
               }
               Roots_DestroyDirectory(&pool);
-              MODEL_EXPECT(r.head()->reserved[0] == 0 && Roots_GetCount(&pool) == -1);
+              MODEL_EXPECT(r.word(8) == 0 && Roots_GetCount(&pool) == -1);
               ESA_FreeArray(r.c[0]), RBT_FreeTree(r.c[1]), RbtInt32_FreeTree(r.c[2]);
               RbtVoidPtr_FreeTree(r.c[3]), HST_FreeTree(r.c[4]);
               MODEL_EXPECT(r.word(16) == kSize - 16);  // one free block again: nothing leaked

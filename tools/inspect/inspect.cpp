@@ -438,8 +438,6 @@ int Refuse(bool json, FILE *out, const char *message) {
 
 int Run(const Request &request, const void *image, size_t size, FILE *out) {
   Ctx c{request, image, size, coffer::ViewOfImage(image, size), Writer{out, request.json}};
-  if (c.view.limit < sizeof(ShRegionHeader) + sizeof(ShBlockHeader))
-    return Refuse(request.json, out, "not a region: its header leaves no room for a block");
   switch (request.command) {
     case kCheck: return Check(c);
     case kStats: return Stats(c);
