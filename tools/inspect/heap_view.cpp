@@ -27,8 +27,11 @@ HeapState CheckHeap(const void *image, size_t mapped, HeapStats *stats, HeapSink
   }
   if (sound) return kHeapSound;
   static char text[160];
-  std::snprintf(text, sizeof text, "%s", why.c_str());
-  sink(context, HeapFinding{text, 0, true});
+  unsigned at = 0;
+  const size_t cut = why.rfind(" (block at ");
+  std::snprintf(text, sizeof text, "%s", why.substr(0, cut).c_str());
+  if (cut != std::string::npos) std::sscanf(why.c_str() + cut, " (block at %u)", &at);
+  sink(context, HeapFinding{text, at, true});
   return kHeapDamaged;
 }
 

@@ -161,7 +161,10 @@ int Check(Ctx &c) {
     w.B("intact", p.damage == 0), w.U("damage", p.damage), w.U("notes", p.notes);
     w.End('}');
   } else {
-    std::fprintf(w.f, p.damage ? "damaged: %u problems\n" : "intact\n", p.damage);
+    if (p.damage)
+      std::fprintf(w.f, "damaged: %u problem%s\n", p.damage, p.damage == 1 ? "" : "s");
+    else
+      std::fprintf(w.f, "intact\n");
   }
   return p.damage ? 1 : 0;
 }
