@@ -208,7 +208,7 @@ TEST(Inspect, EveryCommandOnAnIntactRegion) {
   const std::pair<std::string, const char *> kRuns[] = {  // a command and a line it prints
       {"check", "intact\n"},
       {"stats", "\nfree list length    "},
-      {"roots", "\"tree\"  hst"},
+      {"roots", "\n\"tree\"                   hst "},
       {"dump array", "\n\"y\" = 1\n"},
       {"dump rbt", "rbt: 2 nodes, height 2\n"},
       {"dump --kind rbt-int32 --at " + std::to_string(r.rec(2)), "\n121 = 3\n"},

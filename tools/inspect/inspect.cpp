@@ -46,18 +46,21 @@ struct Writer {
   void I(const char *key, int64_t v) { Sep(key), std::fprintf(f, "%lld", static_cast<long long>(v)); }
   void B(const char *key, bool v) { Sep(key), std::fputs(v ? "true" : "false", f); }
   void S(const char *key, const char *s) { Sep(key), Quoted(s, std::strlen(s)); }
-  void Quoted(const char *s, size_t n) {
+  // Returns the number of characters written.
+  int Quoted(const char *s, size_t n) {
+    int written = 2;
     std::fputc('"', f);
     for (size_t i = 0; i < n; i++) {
       const unsigned char c = static_cast<unsigned char>(s[i]);
       if (c == '"' || c == '\\')
-        std::fprintf(f, "\\%c", c);
+        written += std::fprintf(f, "\\%c", c);
       else if (c < 0x20 || c >= 0x7F)
-        std::fprintf(f, json ? "\\u%04x" : "\\x%02x", c);
+        written += std::fprintf(f, json ? "\\u%04x" : "\\x%02x", c);
       else
-        std::fputc(c, f);
+        written++, std::fputc(c, f);
     }
     std::fputc('"', f);
+    return written;
   }
 };
 
@@ -224,6 +227,7 @@ int Roots(Ctx &c) {
   if (!dir) return Refuse(c.w.json, c.w.f, why);
   Writer &w = c.w;
   if (w.json) w.Begin(nullptr, '{'), w.S("command", "roots"), w.Begin("roots", '[');
+  else std::fprintf(w.f, "%-24s %-11s %10s  %s\n", "name", "kind", "record", "size");
   const RootsEntry *e = coffer::RootsEntries(c.view, dir);
   for (int32_t i = 0; i < dir->count; i++) {
     const char *fault = coffer::RootsRecordFault(c.view, e[i].kind, e[i].record);
@@ -234,12 +238,12 @@ int Roots(Ctx &c) {
       w.End('}');
       continue;
     }
-    w.Quoted(e[i].name, std::strlen(e[i].name));
-    std::fprintf(w.f, "  %-11s at %-10u", kind, e[i].record);
+    const int width = w.Quoted(e[i].name, std::strlen(e[i].name));
+    std::fprintf(w.f, "%*s %-11s %10u  ", width < 24 ? 24 - width : 0, "", kind, e[i].record);
     if (fault)
-      std::fprintf(w.f, " damaged: %s\n", fault);
+      std::fprintf(w.f, "damaged: %s\n", fault);
     else
-      std::fprintf(w.f, " size %lld\n", static_cast<long long>(SizeOf(c, e[i].kind, e[i].record)));
+      std::fprintf(w.f, "%lld\n", static_cast<long long>(SizeOf(c, e[i].kind, e[i].record)));
   }
   if (w.json) w.End(']'), w.End('}');
   if (!w.json && dir->count == 0) std::fprintf(w.f, "no roots\n");
@@ -276,7 +280,8 @@ void TreeKey(Ctx &c, uint32_t kind, const RbtNode *n) {
   Writer &w = c.w;
   if (kind == ROOTS_KIND_RBT) {
     if (w.json) return w.S("key", Str(c, n->key));
-    return w.Quoted(Str(c, n->key), std::strlen(Str(c, n->key)));
+    w.Quoted(Str(c, n->key), std::strlen(Str(c, n->key)));
+    return;
   }
   if (kind == ROOTS_KIND_RBT_INT32) {
     if (w.json) return w.I("key", static_cast<int32_t>(n->key));
