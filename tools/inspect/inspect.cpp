@@ -414,7 +414,8 @@ int Dump(Ctx &c) {
   coffer::CheckFault fault;
   if (!ContainerSound(c, kind, off, &fault)) {
     char message[200];
-    std::snprintf(message, sizeof message, "%s at %u damaged at %u: %s", coffer::RootsKindName(kind), off,
+    const char *name = coffer::RootsKindName(kind);
+    std::snprintf(message, sizeof message, "%s at %u damaged at %u: %s", name ? name : "record", off,
                   fault.at, fault.what);
     return Refuse(c.w.json, c.w.f, message);
   }
