@@ -182,6 +182,7 @@ TEST(Roots, RefusedPoolCallsLeaveTheRegionAsItWas) {
 }
 
 // ---- coffer-inspect ------------------------------------------------------------
+#ifdef COFFER_INSPECT  // built with the tools
 
 const char *const kNames[] = {"array", "rbt", "int", "ptr", "tree"};
 
@@ -276,6 +277,8 @@ TEST(Inspect, RandomBytesGetAnAnswerNeverACrash) {
     }
   }
 }
+
+#endif
 
 }  // namespace
 }  // namespace coffer_test
