@@ -2,11 +2,12 @@
 # Builds every fuzz target, tests/fuzz/*_fuzz.cpp, with libFuzzer and the
 # address and undefined-behaviour sanitizers, and runs each for the given
 # number of seconds (default 60) from its corpus, tests/fuzz/corpus/<target>.
-# The library and the test support (models, drivers, test pool) are compiled
-# once, instrumented, into archives that every target links with, so a
-# target takes whatever it calls. Inputs that add coverage go to
-# build-fuzz/corpus/<target>, leaving the committed corpus as it is; a crash
-# is saved under build-fuzz/crashes and fails the run.
+# The library, the test support (models, drivers, test pool) and
+# coffer-inspect's reader are compiled once, instrumented, into archives
+# that every target links with, so a target takes whatever it calls. Inputs
+# that add coverage go to build-fuzz/corpus/<target>, leaving the committed
+# corpus as it is; a crash is saved under build-fuzz/crashes and fails the
+# run.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 seconds=${1:-60}
@@ -20,7 +21,7 @@ flags=(-m32 -g -O1 -std=c++17 -fno-exceptions -fsanitize=address,undefined
 archive() {
   local name=$1 objs=() src obj
   shift
-  if [[ -f $out/$name.a ]] && [[ -z $(find include platform mempool esa rbt hst hstaa tests/support \
+  if [[ -f $out/$name.a ]] && [[ -z $(find include platform mempool esa rbt hst hstaa roots tools tests/support \
     -newer "$out/$name.a" -name '*.[ch]*' -print -quit) ]]; then
     return
   fi
@@ -33,13 +34,15 @@ archive() {
   rm -f "$out/$name.a"
   ar rcs "$out/$name.a" "${objs[@]}"
 }
-archive library platform/*.cpp mempool/*.cpp esa/*.cpp rbt/*.cpp hst/*.cpp hstaa/*.cpp
+archive library platform/*.cpp mempool/*.cpp esa/*.cpp rbt/*.cpp hst/*.cpp hstaa/*.cpp roots/*.cpp
 archive support tests/support/*.cpp
+# coffer-inspect's reader: every command on a region image, without main.
+archive reader tools/inspect/inspect.cpp tools/inspect/heap_view.cpp
 
 for src in tests/fuzz/*_fuzz.cpp; do
   name=$(basename "$src" .cpp)
   echo "== $name: ${seconds}s"
-  clang++ "${flags[@]}" -fsanitize=fuzzer "$src" "$out/support.a" "$out/library.a" -lpthread \
+  clang++ "${flags[@]}" -fsanitize=fuzzer "$src" "$out/reader.a" "$out/support.a" "$out/library.a" -lpthread \
     -o "$out/$name"
   mkdir -p "$out/corpus/$name" "tests/fuzz/corpus/$name"
   status=0

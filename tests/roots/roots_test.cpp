@@ -248,6 +248,8 @@ TEST(Inspect, DamageIsReportedWithItsOffset) {
       {"block misaligned", [](Region &r, uint32_t A, uint32_t) { return r.word(A) += 2, A; }},
       {"previous size", [](Region &r, uint32_t A, uint32_t) { return r.word(A + 4) += 4, A; }},
       {"half free", [](Region &r, uint32_t A, uint32_t) { return r.word(A + 8) = 16, A; }},
+      {"link to no block", [](Region &r, uint32_t, uint32_t F) { return r.word(F + 8) = F + 4, F; }},
+      {"link to an allocated block", [](Region &r, uint32_t A, uint32_t) { return r.word(4) = A, 0u; }},
       {"back link", [](Region &r, uint32_t A, uint32_t F) { return r.word(F + 12) = A, F; }},
       {"list cycle", [](Region &r, uint32_t, uint32_t F) { return r.word(F + 8) = F, F; }},
       {"free block unlisted", [](Region &r, uint32_t, uint32_t F) { return r.word(4) = SH_NO_BLOCK, F; }},

@@ -1,38 +1,44 @@
-// The heap view over the library's checker as it stands: the first fault
-// only, and the counts it keeps. (Replaced by a direct call once the checker
-// reports every fault and the statistics itself.)
+// The heap view: the library's own region heap checker, compiled into the
+// tool, its findings and counts passed on as they are.
 #include "tools/inspect/heap_view.h"
 
 #include <cstring>
-#include <string>
 
 #include "mempool/region_heap.h"
 
 namespace inspect {
+namespace {
+
+struct Relay {
+  HeapSink sink;
+  void *context;
+};
+
+void RelayFault(void *context, coffer::ShFault fault, uint32_t at) {
+  const auto *r = static_cast<const Relay *>(context);
+  r->sink(r->context, HeapFinding{coffer::SHFaultText(fault), at, coffer::SHFaultIsDamage(fault)});
+}
+
+}  // namespace
 
 HeapState CheckHeap(const void *image, size_t mapped, HeapStats *stats, HeapSink sink,
                     void *context) {
-  if (stats) std::memset(stats, 0, sizeof *stats);
-  const auto *h = static_cast<const ShRegionHeader *>(image);
-  if (mapped < 2 * sizeof *h + 1 || h->regionSize > mapped || h->regionSize <= 32) {
-    sink(context, HeapFinding{"regionSize leaves no room for a block, or is larger than the mapping", 0, true});
-    return kHeapDamaged;
-  }
-  coffer::ShHeapCounts c;
-  std::string why;
-  const bool sound = coffer::SHCheckHeap(image, &c, &why);
+  static_assert(sizeof(HeapStats) == sizeof(coffer::ShHeapCounts), "the same counts");
+  coffer::ShHeapCounts counts;
+  Relay relay = {sink, context};
+  const coffer::ShHeapState state = coffer::SHCheckRegion(image, mapped, &counts, RelayFault, &relay);
   if (stats) {
-    stats->freeBlocks = c.freeBlocks, stats->allocatedBlocks = c.allocatedBlocks;
-    stats->freeBytes = c.freeBytes, stats->allocatedBytes = c.allocatedBytes;
+    stats->freeBlocks = counts.freeBlocks, stats->allocatedBlocks = counts.allocatedBlocks;
+    stats->freeBytes = counts.freeBytes, stats->allocatedBytes = counts.allocatedBytes;
+    stats->largestFree = counts.largestFree, stats->freeListLength = counts.freeListLength;
+    std::memcpy(stats->sizeLog2, counts.sizeLog2, sizeof stats->sizeLog2);
   }
-  if (sound) return kHeapSound;
-  static char text[160];
-  unsigned at = 0;
-  const size_t cut = why.rfind(" (block at ");
-  std::snprintf(text, sizeof text, "%s", why.substr(0, cut).c_str());
-  if (cut != std::string::npos) std::sscanf(why.c_str() + cut, " (block at %u)", &at);
-  sink(context, HeapFinding{text, at, true});
-  return kHeapDamaged;
+  switch (state) {
+    case coffer::ShHeapState::kSound: return kHeapSound;
+    case coffer::ShHeapState::kUntidy: return kHeapUntidy;
+    case coffer::ShHeapState::kDamaged: return kHeapDamaged;
+    default: return kHeapNoMemory;
+  }
 }
 
 }  // namespace inspect
