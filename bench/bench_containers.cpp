@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Benchmarks the containers against the standard library's nearest
 // equivalents. A program, not a test: it prints times and ratios and judges
 // nothing.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Benchmark of coffer-inspect's check and stats on a live-sized region: 64
 // MiB holding 100,000 blocks, a third of them free and scattered, with a
 // directory naming a string-keyed tree and a sorted array that hold most of

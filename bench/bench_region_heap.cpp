@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The region heap on its own: a seeded trace of mixed allocations and
 // releases in a 64 MiB region, timed through SH_Alloc and SH_Free. A program,
 // not a test: it prints nanoseconds per call and judges nothing. The time is

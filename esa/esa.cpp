@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Sorted string array: entries kept in strcmp order of their keys, found by
 // bisection. The entry block grows linearly by capacityIncrement slots and
 // shrinks straight to the entries in use once the slack reaches that step.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The sorted string array's invariant checker (see esa_internal.h).
 #include <cstring>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Internal operations of the sorted string array, visible to its tests and to
 // the string tree, which searches and fills the child arrays of its nodes.
 #ifndef COFFER_ESA_INTERNAL_H

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /* A configuration tree with array templates. "/servers/#" is the template of
  * the server array: an element such as "/servers/#1" is made as a copy of it
  * on first use, a setting made through the template reaches every element

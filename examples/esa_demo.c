@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /* A sorted string array on the process heap, with a release callback. */
 #include <coffer/esa.h>
 #include <stdio.h>

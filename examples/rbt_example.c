@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /* A word counter and a small agenda on red-black trees in the process heap.
  *
  * The string tree keeps one node per occurrence (equal keys stay in the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /* Containers shared by processes, found by name.
  *
  * The parent creates a shared memory object, formats it as a heap region

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The string tree's invariant checker (see hst_internal.h), with the value
 // counts of the associative-array layer as an option: both are one walk.
 #include <cstdlib>

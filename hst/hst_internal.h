@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Accessors shared by the string tree's source files: the one place where
 // the tree's offsets become records, the transient handle over a node's
 // child array, and the node primitives behind the exported ones, which the

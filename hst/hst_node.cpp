@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The string tree's records, its creation, the node primitives and the
 // accessors that read a node and its children.
 #include <cstddef>

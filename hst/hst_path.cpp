@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Path lookup and path insertion over the path rules of hst_internal.h.
 #include <cstdlib>
 #include <cstring>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Whole-tree operations of the string tree: releasing values and subtrees,
 // removal, clearing, freeing, renaming a detached node and copying subtrees.
 #include <cstring>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Associative arrays over the string tree: path-keyed values, a value count
 // per subtree, and array templates. Under any node, a child named "#" or "##"
 // is the template (representative) of the array whose elements are the

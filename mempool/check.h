@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // What the invariant checkers share: the report of a broken invariant, and
 // the hook that runs a checker at the end of every change in checking builds
 // (configured with COFFER_CHECKS=ON).

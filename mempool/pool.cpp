@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 #include "mempool/pool.h"
 
 #include <cstddef>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Shared conventions of every container family: offset conversion, pool
 // calls made through a handle, handle allocation and release, value drop.
 #ifndef COFFER_MEMPOOL_POOL_H

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The region heap: a first-two-fit allocator whose bookkeeping lives entirely
 // inside a caller-supplied region and links blocks by region offset, so one
 // region can be mapped at different addresses by several processes.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Internal operations of the region heap, for the pools, the checker and tests.
 #ifndef COFFER_MEMPOOL_REGION_HEAP_H
 #define COFFER_MEMPOOL_REGION_HEAP_H

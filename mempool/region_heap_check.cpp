@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The region heap checker: one walk over the blocks, one over the free list,
 // every fault reported with its offset. It runs on regions of any content
 // (an inspection tool runs it on whatever a file or mapping holds), so it

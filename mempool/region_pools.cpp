@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The two pools over a heap region: the shared-heap pool, which holds the
 // caller's exclusive lock around each region-heap call and treats an
 // exhausted region as fatal, and the simple-heap pool, which takes no lock

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The process-heap pool: the standard allocator, with exhaustion fatal.
 #include <cstdlib>
 #include <cstring>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Platform layer: the fatal report and a robust, process-shared mutex kept in
 // caller memory (so it can live inside a shared region).
 #include <coffer/platform.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // String-keyed red-black tree. Keys are copied into the pool and ordered
 // byte by byte with each byte read as signed (the NUL counts as 0), which is
 // not strcmp order: a byte of 0x80 or above sorts before the terminator.

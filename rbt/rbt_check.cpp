@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The red-black trees' invariant checker: the invariants stated above the
 // balancing code in rbt_core.cpp, verified by one bounded walk. Each key
 // order is restated here on its own, so the checker does not trust the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Red-black balancing on a tree with a sentinel, shared by every key family:
 // rotations, insertion fix-up, removal with successor relinking, and the
 // key-independent parts of the lifecycle. The neighbour walks are inline, in

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The key-dependent procedures of the red-black trees, written once over a
 // key policy. A policy K provides:
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Internal operations of the red-black trees, shared by the string, 32-bit
 // integer and pointer families and visible to their tests.
 //

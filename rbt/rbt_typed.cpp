@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Red-black trees keyed by a 32-bit word kept in the node itself: signed
 // integers in serial order and pointers in unsigned address order. Nothing
 // about a key is allocated, so a caller's node makes insertion allocation-free.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The directory of named roots: created, changed and read through a pool
 // whose base is a heap region (see roots.h for what is trusted and why).
 // Invariants between calls, stated where they are maintained: the entries

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Reading a directory of named roots, and judging the records it names, in
 // a region whose bytes may be stale, damaged or hostile: every offset is
 // checked against the region before it is followed, and every walk is

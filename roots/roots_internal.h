@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Internal operations of the named roots: reading a directory and judging
 // records in a region whose bytes are not trusted. Nothing here allocates or
 // writes, so the inspection tool builds the same code.

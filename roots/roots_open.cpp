@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Handles opened around containers that live in a region, by record offset
 // or by root name: each call checks the record as its family needs before it
 // fills the caller's handle, and leaves the handle untouched on refusal.

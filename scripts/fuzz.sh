@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: MIT
 # Builds every fuzz target, tests/fuzz/*_fuzz.cpp, with libFuzzer and the
 # address and undefined-behaviour sanitizers, and runs each for the given
 # number of seconds (default 60) from its corpus, tests/fuzz/corpus/<target>.

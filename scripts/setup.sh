@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: MIT
 # Installs what building and testing coffer needs on Debian 12 (run as root):
 # the 32-bit toolchain, the GoogleTest sources, CMake and make, binutils
 # (readelf), pkg-config for the consumer test, abigail-tools (abidw,

@@ -1,4 +1,5 @@
 #!/usr/bin/env bash
+# SPDX-License-Identifier: MIT
 # Installs what is missing, builds coffer and runs the whole test suite twice:
 # optimised, then (after each fuzz target has run briefly from its corpus)
 # under AddressSanitizer and UndefinedBehaviorSanitizer with the library

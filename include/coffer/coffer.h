@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /* coffer: container data structures whose records live in a caller-chosen
  * memory pool, shareable between processes. This header brings everything a
  * program needs: the version, the platform layer (Panic and the process-shared

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /** @file
  * coffer sorted string array: (key, value) entries in strcmp order of their
  * keys (bytes compared as unsigned), found by bisection. Equal keys are

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /** @file
  * coffer hierarchical string tree: nodes named by strings, each holding one
  * value, addressed by walking named children or by paths such as /a/b. Each

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /** @file
  * coffer associative arrays over the string tree: path-keyed values with a
  * value count per subtree, and array templates.

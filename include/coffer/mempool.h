@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /** @file
  * coffer memory pools and the region heap.
  *

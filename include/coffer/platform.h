@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /** @file
  * coffer platform layer: fatal reports and a process-shared exclusive lock.
  *

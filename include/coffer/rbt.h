@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /** @file
  * coffer red-black trees: ordered (key, value) trees with duplicates,
  * addressed by node. Three families share one handle and node layout and

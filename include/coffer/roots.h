@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /** @file
  * coffer named roots: a small directory inside a heap region that maps names
  * to the containers kept there, so that every process mapping the region

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The sorted string array's sharp edges: the order of its pool calls, the
 // capacities it refuses, and its checker firing on damaged arrays.
 #include <gtest/gtest.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Fuzz target: coffer-inspect's reader on the fuzzer's bytes as a region
 // image. Every command runs, in text and JSON, then a dump of every root the
 // directory names and of a record at an offset the last bytes name, as each

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Fuzz target: every family against its model; the first byte picks it.
 #include "support/driver.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The string tree's sharp edges: the order of its pool calls, siblings of
 // one name, detached nodes, what a failed copy releases, and the checker
 // firing on damaged trees.

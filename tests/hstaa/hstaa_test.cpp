@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The associative arrays' sharp edges: how keys are classified, paths that
 // name nothing, and propagation modes that change nothing.
 #include <coffer/hstaa.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Every family against its model: on seeded random operations, under the
 // failure-injection driver, and inside a heap region through both region
 // pools.

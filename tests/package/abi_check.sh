@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: MIT
 # Compares libcoffer.so ($2) and libcoffer-platform.so ($3) with the ABI of
 # coffer 1.0.0 recorded in $1/abi (the abi-record target writes it). abidiff
 # counts a member appended to a record as harmless, but these records are a

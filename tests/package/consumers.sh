@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: MIT
 # Installs the build tree $2 (of the sources $1) into a temporary prefix and
 # builds and runs one C program against it with pkg-config, with -lcoffer
 # alone, with find_package, and against the sources with add_subdirectory.

@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: MIT
 # Counts the exported calls (every global of coffer.map and platform.map)
 # whose declaration in include/coffer/ has no complete comment block right
 # above it: /** ... */ with @param for each argument, @return unless the call

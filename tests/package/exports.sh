@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: MIT
 # libcoffer.so ($1) exports exactly the calls its version script ($2) lists,
 # carries its SONAME, and leaves the platform calls to the dynamic linker
 # (unbound, and no DT_SYMBOLIC), so a program can interpose its own.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /* A program's own Panic replaces the platform layer's for the library: the
  * library reaches it through the dynamic linker. */
 #include <coffer/coffer.h>

@@ -1,4 +1,5 @@
 #!/bin/sh
+# SPDX-License-Identifier: MIT
 # libcoffer.so ($1) may need the C library and the platform library only,
 # plus the libraries matched by the extended regular expression $2.
 set -eu

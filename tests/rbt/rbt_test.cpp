@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The red-black trees' sharp edges: the order of pool calls and releases,
 // what a release callback sees, sentinels that travel with a swap, and the
 // checker firing on damaged trees.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Named roots and coffer-inspect. The directory against a model, read again
 // from a copy of the region at another address; the directories and records
 // it must refuse; refused pool calls. Then the tool, run as a process on

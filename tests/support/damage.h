@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Tables of damage a checker must find. Each row damages a structure kept in
 // a heap region; the check must then fail and name what the row names. The
 // region's bytes are put back after every row.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The model drivers: each family's reference model, run side by side with
 // the library on operations read from a byte string (seeded random bytes in
 // the tests, the fuzzer's input in the fuzz targets), comparing the whole

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The sorted string array against a vector of entries.
 #include <coffer/esa.h>
 

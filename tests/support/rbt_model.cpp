@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The three red-black tree families against a vector of entries in key
 // order (equal keys in insertion order); the balancing itself is left to the
 // library's checker.

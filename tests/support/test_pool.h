@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The caller-supplied pool of the tests and the log of released values.
 // Nothing here depends on GoogleTest, so the fuzz targets use it too.
 #ifndef COFFER_TESTS_SUPPORT_TEST_POOL_H

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The string tree and the associative arrays against one reference tree
 // (children in a std::map, whose byte order is strcmp's), compared node by
 // node after every step together with the exact sequence of callbacks.

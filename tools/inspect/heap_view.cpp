@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The heap view: the library's own region heap checker, compiled into the
 // tool, its findings and counts passed on as they are.
 #include "tools/inspect/heap_view.h"

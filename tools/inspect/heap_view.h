@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // What coffer-inspect needs from the region heap's checker: every finding
 // with its offset, and the statistics of one walk. A thin view over the
 // library's own checker, compiled into the tool.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // coffer-inspect's commands on a region image. Each reads only what a
 // checker has vouched for: the heap checker for blocks, the directory's
 // checks for roots, the family's checker (with the region as its span) for a

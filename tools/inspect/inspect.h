@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The reader behind coffer-inspect: each command run on a region image in
 // memory, so that the fuzz target runs exactly what the tool runs. Nothing
 // here trusts the image: the heap checker, the directory's checks and each

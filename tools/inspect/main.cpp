@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // coffer-inspect: looks inside a coffer heap region kept in a file or a
 // shared memory object, read-only. See coffer-inspect.1.
 #include <csetjmp>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Opening a region read-only. The tool never writes: the descriptor is
 // opened O_RDONLY and mapped PROT_READ, so a mistake here faults instead of
 // changing a live region.

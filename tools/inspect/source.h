@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Where coffer-inspect reads a region: a file or a POSIX shared memory
 // object, mapped read-only from a byte offset on.
 #ifndef COFFER_TOOLS_INSPECT_SOURCE_H

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 /* A user's program: one header, a lock of the platform layer (unless PLAIN,
  * for a link with -lcoffer alone) and a container in a locked region. */
 #include <coffer/coffer.h>
