@@ -1,5 +1,5 @@
-// The region heap through SH_* and both pools, against the model: the model
-// test's driver with the fuzzer's bytes.
+// The region heap through the checked calls and both pools, against the
+// model: the model test's driver on the fuzzer's bytes.
 #include <cstdio>
 #include <cstdlib>
 
