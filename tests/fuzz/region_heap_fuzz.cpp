@@ -1,5 +1,4 @@
-// The region heap through the checked calls and both pools, against the
-// model: the model test's driver on the fuzzer's bytes.
+// The region heap against its model: the model test's driver on the fuzzer's bytes.
 #include <cstdio>
 #include <cstdlib>
 
