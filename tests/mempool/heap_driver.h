@@ -29,9 +29,9 @@ struct Region {
 inline std::vector<uint32_t> Changed(const std::vector<uint32_t> &a,
                                      const std::vector<uint32_t> &b) {
   std::vector<uint32_t> offs;
-  for (uint32_t w = 0, n = uint32_t(a.size()); w < n; w += 16)
-    if (std::memcmp(&a[w], &b[w], 4 * std::min(16u, n - w)))
-      for (uint32_t k = w; k < std::min(w + 16, n); ++k)
+  for (uint32_t w = 0, n = uint32_t(a.size()); w < n; w += 256)
+    if (std::memcmp(&a[w], &b[w], 4 * std::min(256u, n - w)))
+      for (uint32_t k = w; k < std::min(w + 256, n); ++k)
         if (a[k] != b[k]) offs.push_back(4 * k);
   return offs;
 }
