@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // Regions of any content, attached as they are: heap calls and checker must
 // not crash, loop or touch a byte outside the region (a heap block of just
 // its size, for the sanitizer; the checker also gets a shorter mapping), and

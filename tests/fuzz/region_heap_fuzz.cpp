@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The region heap against its model: the model test's driver on the fuzzer's bytes.
 #include <cstdio>
 #include <cstdlib>

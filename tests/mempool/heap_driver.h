@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The region heap against a model: operations decoded from a byte string run
 // through the checked heap calls and both pools, and after each the whole
 // observable state must match the model: the offset returned, the refusal,

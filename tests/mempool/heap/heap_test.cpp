@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: MIT
 // The pools and the region heap: the model, damaged regions, the pools'
 // reports, handle conventions, processes sharing a region. The program has
 // its own heap, with a point after every header write where a process can be
