@@ -130,6 +130,17 @@ std::string Compare(RbtTree *t, const Model<F> &m, TestPool *tp) {
   return "";
 }
 
+// The release callback, which also notes the tree's size: a value goes while
+// its node is still counted.
+template <class F>
+RbtTree *g_tree;
+std::vector<int32_t> g_sizes;
+template <class F>
+void Release(CofferVal val) {
+  RecordRelease(val);
+  g_sizes.push_back(F::size(g_tree<F>));
+}
+
 template <class F>
 std::string Run(Ops &ops, Arena arena) {
   using Key = typename F::Key;
@@ -141,11 +152,11 @@ std::string Run(Ops &ops, Arena arena) {
   OpWatch made(arena.tp);
   RbtTree *t = lent ? F::allocWithNil(arena.pool, lent) : F::allocEx(arena.pool);
   if (!t) return made.Refused() ? "" : "creation failed unrefused";
-  F::setFreeValFn(t, RecordRelease);
+  F::setFreeValFn(g_tree<F> = t, Release<F>);
   Model<F> m;
   size_t spareUsed = 0;
   for (CofferVal next = 1; ops.More(); next++) {
-    Releases().clear();
+    Releases().clear(), g_sizes.clear();
     std::vector<CofferVal> dropped;
     OpWatch op(arena.tp);
     const size_t n = m.size();
@@ -188,11 +199,11 @@ std::string Run(Ops &ops, Arena arena) {
       RbtTree *other = lend ? F::allocWithNil(arena.pool, lend) : F::allocEx(arena.pool);
       if (!other) MODEL_EXPECT(op.Refused());
       if (!other) continue;
-      F::setFreeValFn(other, RecordRelease);  // callbacks stay with their handles
+      F::setFreeValFn(other, Release<F>);  // callbacks stay with their handles
       F::swap(t, other);
       MODEL_EXPECT(F::size(t) == 0 && F::first(t) == nullptr);
       F::freeTree(t);
-      t = other;
+      g_tree<F> = t = other;
     } else if (kind == 14) {
       dropped.clear();
       for (const auto &x : m) dropped.push_back(x.val);
@@ -202,6 +213,7 @@ std::string Run(Ops &ops, Arena arena) {
       arena.tp->FailAt(arena.tp->calls());
     }
     MODEL_EXPECT(ReleasedVals() == dropped);
+    for (size_t i = 0; i < dropped.size(); i++) MODEL_EXPECT(g_sizes[i] >= static_cast<int32_t>(n - i));
     MODEL_TRY(Compare<F>(t, m, arena.tp));
   }
   Releases().clear();

@@ -81,6 +81,14 @@ void LogReleases(const MNode *n) {
   for (auto &k : n->kids) LogReleases(k.second.get());
   Release(n->val);
 }
+// Runs the model's side of a step, its callbacks logged into want.
+template <class Step>
+auto Expect(std::vector<std::string> *want, Step step) {
+  std::swap(*want, g_log);
+  auto result = step();
+  std::swap(*want, g_log);
+  return result;
+}
 
 // The library's tree against the model's, node by node; wires up lib.
 std::string Compare(HstTree *t, HstNode *h, MNode *m, bool derived, TestPool *tp) {
@@ -271,20 +279,21 @@ std::string RunHstModel(Ops &ops, Arena arena) {
     OpWatch op(arena.tp);
     const uint32_t kind = ops.Take(16);
     Path p = MakePath(ops, sep, kNames);
-    const std::string text = (ops.Take(2) ? "/" : "x") + p.text;
+    // An empty path has no first character to skip: it names nothing.
+    const std::string text = ops.Take(16) ? (ops.Take(2) ? "/" : "x") + p.text : "";
     if (kind < 4) {  // insert at a path: missing names made with the default value
       HstNode *got = HST_Insert(t, text.c_str(), next);
       MNode *n = &m.root;
-      for (const std::string &k : p.names) {
+      for (const std::string &k : text.empty() ? Names{} : p.names) {
         MNode *c = Child(n, k);
         HstNode *h = HST_FindChild(t, n->lib, k.c_str());
         if (!c && h) (c = Attach(n, New(m.dv), k))->lib = h;  // made by this call
         if (!(n = c)) break;  // refused here: what was made stays
       }
-      MODEL_EXPECT(!got == op.Refused() && got == LibOf(got ? n : nullptr));
+      MODEL_EXPECT(!got == (op.Refused() || text.empty()) && got == LibOf(got ? n : nullptr));
       if (got) n->val = next;
     } else if (kind < 6) {  // find, through a path or by name
-      MODEL_EXPECT(HST_Find(t, text.c_str()) == LibOf(Lookup(&m.root, p.names)));
+      MODEL_EXPECT(HST_Find(t, text.c_str()) == LibOf(text.empty() ? nullptr : Lookup(&m.root, p.names)));
       MODEL_EXPECT(HST_FindChild(t, x->lib, p.text.c_str()) == LibOf(Child(x, p.text)));
     } else if (kind == 6 && !Child(x, p.text)) {  // a new child by name
       HstNode *got = HST_InsertChild(t, x->lib, p.text.c_str(), next);
@@ -300,17 +309,13 @@ std::string RunHstModel(Ops &ops, Arena arena) {
       if (got) Attach(x, New(next), p.text);
     } else if (kind < 10) {  // remove a subtree; the root's empties the tree
       HST_RemoveSubtree(t, x->lib);
-      std::swap(want, g_log);
-      m.Drop(x);
-      std::swap(want, g_log);
+      Expect(&want, [&] { return m.Drop(x), 0; });
     } else if (kind < 12 && x != &m.root) {  // copy x's subtree under y, maybe renamed
       const std::string key = ops.Take(2) ? p.text : x->key;
       g_b.refuseClone = ops.Take(3) ? -1 : static_cast<int>(ops.Take(next) % 1000);
       if (Child(y, key)) continue;  // sibling names stay unique
       HstNode *got = HST_CloneSubtree(t, x->lib, CloneVal, key == x->key ? nullptr : key.c_str(), y->lib);
-      std::swap(want, g_log);
-      std::unique_ptr<MNode> copy = m.Clone(x);
-      std::swap(want, g_log);
+      std::unique_ptr<MNode> copy = Expect(&want, [&] { return m.Clone(x); });
       if (op.Refused()) {  // every value the copy made is released again, and only those
         std::map<CofferVal, int> copies;
         for (const std::string &e : g_log) {
@@ -335,9 +340,7 @@ std::string RunHstModel(Ops &ops, Arena arena) {
       for (MNode *n = x; n; n = n->parent) n->count += delta;
     } else if (kind < 15) {  // clear: the root's value goes last
       HST_Clear(t);
-      std::swap(want, g_log);
-      m.Drop(&m.root);
-      std::swap(want, g_log);
+      Expect(&want, [&] { return m.Drop(&m.root), 0; });
     } else if (arena.tp) {
       arena.tp->FailAt(arena.tp->calls());
     }
@@ -370,22 +373,27 @@ std::string RunHstaaModel(Ops &ops, Arena arena) {
     MNode *start = ops.Take(3) ? &m.root : all[ops.Take(all.size())];
     const bool relative = start != &m.root || ops.Take(2);
     Path p = MakePath(ops, '/', kKeys);
-    const std::string abs = (ops.Take(2) ? "/" : "x") + p.text;
+    for (const std::string &k : p.names) {  // the classes of keys, as the model sees them
+      const char *rep = HSTAA_GetArrayRep(k.c_str());
+      MODEL_EXPECT((rep ? rep : "") == MarkOf(k) && HSTAA_IsArrayRep(k.c_str()) == IsMark(k));
+      MODEL_EXPECT(HSTAA_IsArrayIndex(k.c_str()) == !MarkOf(k).empty());
+    }
+    // An empty absolute path has no first character to skip: it names nothing.
+    const std::string abs = ops.Take(16) ? (ops.Take(2) ? "/" : "x") + p.text : "";
+    const bool none = !relative && abs.empty();
     char text[64];
     std::snprintf(text, sizeof text, "%s", p.text.c_str());
     char *arg = p.text.empty() && ops.Take(2) ? nullptr : text;
     const CofferVal v = 1 + ops.Take(4);
     OpWatch op(arena.tp);
-    const uint32_t kind = ops.Take(16);
+    const uint32_t kind = ops.Take(17);
     std::vector<std::string> want;
     bool whole = true;  // the path text must come back as it was
     HstNode *got = nullptr;
     MNode *mine = nullptr;
     if (kind < 7) {
       got = relative ? HSTAAInsert(&tree, start->lib, arg, v) : HSTAA_Insert(&tree, abs.c_str(), v);
-      std::swap(want, g_log);
-      mine = m.Insert(start, p.names, 0, v);
-      std::swap(want, g_log);
+      mine = none ? nullptr : Expect(&want, [&] { return m.Insert(start, p.names, 0, v); });
       if (op.Refused()) {  // (a refusal inside an element does not stop the insertion)
         coffer::CheckFault fault;
         MODEL_EXPECT(coffer::hst::HSTCheckTree(t, true, &fault));
@@ -400,17 +408,19 @@ std::string RunHstaaModel(Ops &ops, Arena arena) {
         HSTAARemove(&tree, start->lib, arg, v);
       else
         MODEL_EXPECT(HSTAA_Remove(&tree, abs.c_str(), v));
-      std::swap(want, g_log);
-      m.Remove(start, p.names, 0, v);
-      std::swap(want, g_log);
+      if (!none) Expect(&want, [&] { return m.Remove(start, p.names, 0, v), 0; });
     } else if (kind < 15) {
       bool complete = !ops.Take(2);
       HstNode *found = relative ? HSTAAFindPrefix(&tree, start->lib, arg, &complete)
                                 : HSTAA_FindPrefix(&tree, abs.c_str(), &complete);
-      auto reached = m.FindPrefix(start, p.names);
+      auto reached = none ? std::make_pair(&m.root, false) : m.FindPrefix(start, p.names);
       MODEL_EXPECT(found == reached.first->lib && complete == reached.second);
       whole = reached.second;  // else the unresolved name stays cut
-    } else if (arena.tp) {
+    } else if (kind == 15 && !start->kids.empty()) {  // a mode that changes nothing, or no template
+      MNode *rep = std::next(start->kids.begin(), ops.Take(start->kids.size()))->second.get();
+      const int32_t mode = IsMark(rep->key) ? 2 + ops.Take(2) : ops.Take(4);
+      MODEL_EXPECT(HSTAAPropagateVal(&tree, mode, start->lib, rep->lib, text, v));
+    } else if (kind == 16 && arena.tp) {
       arena.tp->FailAt(arena.tp->calls());
     }
     MODEL_EXPECT(!whole || p.text == text);

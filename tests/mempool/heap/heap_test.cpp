@@ -238,7 +238,8 @@ void NextCaller(Shared *s, std::vector<char *> held, uint32_t victim) {
 }
 
 // Each call on each block (an allocation, a release or a resize, to one of
-// the sizes; of null where the block is free) is killed at every point.
+// the sizes; of null where the block is free) is killed at every point,
+// holding the pool's lock, which the next caller must recover.
 TEST(Processes, EveryKillPointLeavesTheRegionUsableOrRefused) {
   static const uint32_t kSizes[] = {0, 8, 48, 100, 600};
   Shared *s = Map();
