@@ -39,11 +39,11 @@ inline void Touch(const void *p) {
 }
 
 // count x size for a pool's calloc; false when the product does not fit in
-// 32 bits (a wrapped product would hand out a block too small).
+// 32 bits. *bytes gets the product even then: wrapped, it would hand out a
+// block too small, which is why every caller must heed the result.
 inline bool CallocBytes(size_t count, size_t size, size_t *bytes) {
-  if (size != 0 && count > static_cast<size_t>(0xFFFFFFFFu) / size) return false;
   *bytes = count * size;
-  return true;
+  return size == 0 || count <= static_cast<size_t>(0xFFFFFFFFu) / size;
 }
 
 // Messages of the pools that treat exhaustion as fatal.

@@ -34,11 +34,8 @@ TEST(Models, RollBackEveryRefusedAllocation) {
   for (auto [name, run] : kRunners)
     for (uint32_t seed = 100; seed <= 110; seed++) {
       std::vector<uint8_t> bytes = RandomBytes(seed, 300);
-      EXPECT_EQ(ForEachFailure([&](Arena a) {
-                  Ops ops(bytes);
-                  return run(ops, a);
-                }),
-                "") << name << " seed " << seed;
+      auto scenario = [&](Arena a) { Ops ops(bytes); return run(ops, a); };
+      EXPECT_EQ(ForEachFailure(scenario), "") << name << " seed " << seed;
     }
 }
 

@@ -193,8 +193,9 @@ inline std::string DriveHeap(const uint8_t *data, size_t n) {
     if (region.off(got) != want)
       fault = "returned " + std::to_string(region.off(got)) + " not " + std::to_string(want);
     const bool refused = out.refusal != coffer::ShRefusal::kNone;
+    const bool outside = off % 4 || off < 32 || off > regionSize;  // where no header could be
     if (via == 0 && what != 7 &&
-        (foreign ? !refused || (out.refusal == coffer::ShRefusal::kNotAllocated && out.at != off)
+        (foreign ? !refused || (out.refusal == coffer::ShRefusal::kNotAllocated ? out.at != off : outside)
                  : refused || out.at))
       fault = "refusal " + std::to_string(int(out.refusal)) + " at " + std::to_string(out.at);
     if (!locks.empty() && locks != "+-") fault = "lock calls " + locks;
