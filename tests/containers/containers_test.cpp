@@ -53,6 +53,8 @@ TEST(Esa, PoolCallsAndReleasesInOrder) {
   ESA_Insert(a, "k", 5);
   ESA_FreeArray(a);
   ESA_FreeArray(nullptr);
+  EsaArray mine = {*tp.pool(), nullptr, nullptr, false, &mine};  // data left from something else
+  EXPECT_TRUE(!ESA_CreateArrayData(&mine, -1, 2) && !mine.data);  // refused before any pool call
   EXPECT_EQ(TakeCallLog(),
             "c1x40 c1x16 r0:0 r0:16 a3 a2 r32 a2 v97 f r16 v98 f v99 f r0 r0:16 a2 v4 f r0 f f "
             "c1x40 c1x16 r0:32 a2 f f f f");
@@ -97,9 +99,7 @@ TEST(Rbt, PoolCallsAndReleasesInOrder) {
   EXPECT_EQ(RbtVoidPtr_CreateTreeData(&h, nullptr), 1);
   RbtVoidPtr_FreeTree(&h);  // not owned: the handle stays, naming no record
   EXPECT_EQ(h.data, nullptr);
-  RBT_FreeTree(nullptr);
-  RbtInt32_FreeTree(nullptr);
-  RbtVoidPtr_FreeTree(nullptr);
+  RBT_FreeTree(nullptr), RbtInt32_FreeTree(nullptr), RbtVoidPtr_FreeTree(nullptr);
   EXPECT_EQ(TakeCallLog(),
             "c1x40 c1x16 c1x24 a2 c1x24 a2 v2 f v1 f f f f f "  // the caller's node stays
             "c1x40 c1x16 c1x24 c1x24 v4 f v5 f f f "

@@ -140,6 +140,8 @@ TEST(Roots, StaleOrDamagedDirectoriesAreRefused) {
   static_cast<RbtTreeData *>(r.c[1]->data)->nil = r.rec(0), static_cast<HstTreeData *>(r.c[4]->data)->size = 0;
   EXPECT_FALSE(RBT_OpenTree(&h, &r.pool, r.rec(1)) || HST_OpenTree(&h, &r.pool, r.rec(4)));
   EXPECT_TRUE(RbtInt32_OpenTree(&h, &r.pool, r.rec(2)) && h.data == r.c[2]->data && !h.ownsHandle);
+  MemPool heap;  // the process heap holds no region, so no directory
+  EXPECT_TRUE(MemPool_InitOnStdHeap(&heap) && !Roots_CreateDirectory(&heap) && Roots_GetCount(&heap) == -1);
 }
 
 // A pool over a region whose allocation calls the failure-injection

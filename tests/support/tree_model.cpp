@@ -5,7 +5,6 @@
 #include <coffer/hstaa.h>
 
 #include <cstdio>
-#include <cstring>
 #include <map>
 #include <memory>
 
@@ -355,8 +354,7 @@ std::string RunHstaaModel(Ops &ops, Arena arena) {
   Model m{ops.Take(2) ? CofferVal{0} : CofferVal{1000}};
   g_b = Behaviour{static_cast<int>(ops.Take(6)) - 1, static_cast<int>(ops.Take(4)) - 1,
                   static_cast<int>(ops.Take(4)) - 1};
-  HstaaTree tree;
-  std::memset(&tree, 0, sizeof tree);
+  HstaaTree tree{};
   tree.hst.mp = *arena.pool;
   tree.cloneValFn = CloneVal;
   tree.insertValFn = [](HstaaTree *, CofferVal cur, CofferVal op, CofferVal *out) { return *out == cur && Apply('I', cur, op, out); };
