@@ -3,8 +3,8 @@
 // operations and under the failure-injection driver (the heap's tests run the
 // models inside a region, in eight processes at once). Then the sharp edges
 // the models do not reach: the order of each family's pool calls and
-// releases, siblings of one name, each checker
-// firing on damaged structures, and the path calls' copies of a path.
+// releases, siblings of one name, each checker firing on damaged structures,
+// and the path calls' copies of a path.
 #include <coffer/hstaa.h>
 #include <gtest/gtest.h>
 

@@ -62,8 +62,13 @@ std::string RunEsaModel(Ops &ops, Arena arena) {
   EsaArray *a = ESA_AllocArrayEx(arena.pool, m.cap, m.inc);
   if (!a) return made.Refused() || m.cap < 0 || m.cap == 0x20000000 ? "" : "creation failed unrefused";
   MODEL_EXPECT(m.cap >= 0 && m.cap < 0x20000000);
-  ESA_SetFreeValFn(a, RecordRelease);
-  for (CofferVal next = 1; ops.More(); next++) {
+  const bool mp = ops.Take(2);  // either kind of release callback: setting one clears the other
+  MODEL_EXPECT(mp ? !ESA_SetMpFreeValFn(a, RecordMpRelease) && !ESA_SetFreeValFn(a, RecordRelease) &&
+                        !ESA_SetMpFreeValFn(a, RecordMpRelease)
+                  : !ESA_SetFreeValFn(a, RecordRelease) && !ESA_SetMpFreeValFn(a, RecordMpRelease) &&
+                        !ESA_SetFreeValFn(a, RecordRelease));
+  const MemPool *pool = mp ? &a->mp : nullptr;  // what the callback gets, the handle's pool copy
+  for (CofferVal next = 0; ops.More(); next++) {  // 0 is a value like any other
     Releases().clear();
     std::vector<CofferVal> dropped;
     OpWatch op(arena.tp);
@@ -104,14 +109,14 @@ std::string RunEsaModel(Ops &ops, Arena arena) {
       m.inc = kIncrements[ops.Take(9)];
       ESA_SetCapacityIncrement(a, m.inc);
     }
-    MODEL_EXPECT(ReleasedVals() == dropped);
+    MODEL_EXPECT(ReleasedVals(pool) == dropped);
     MODEL_TRY(Compare(a, m, arena.tp));
   }
   Releases().clear();
   ESA_FreeArray(a);
   std::vector<CofferVal> rest;
   for (const Entry &x : m.e) rest.push_back(x.second);
-  MODEL_EXPECT(ReleasedVals() == rest);
+  MODEL_EXPECT(ReleasedVals(pool) == rest);
   return "";
 }
 

@@ -66,9 +66,9 @@ std::vector<Released> &Releases() {
   static std::vector<Released> log;
   return log;
 }
-std::vector<CofferVal> ReleasedVals() {
+std::vector<CofferVal> ReleasedVals(const MemPool *pool) {
   std::vector<CofferVal> v;
-  for (const Released &r : Releases()) v.push_back(r.val);
+  for (const Released &r : Releases()) v.push_back(r.pool == pool ? r.val : ~CofferVal{0});
   return v;
 }
 void RecordRelease(CofferVal val) { RecordMpRelease(nullptr, val); }

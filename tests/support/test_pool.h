@@ -53,10 +53,9 @@ void LogCall(const std::string &entry);
 struct Released {
   CofferVal val;
   MemPool *pool;
-  bool operator==(const Released &o) const { return val == o.val && pool == o.pool; }
 };
 std::vector<Released> &Releases();
-std::vector<CofferVal> ReleasedVals();
+std::vector<CofferVal> ReleasedVals(const MemPool *pool = nullptr);  // one given another pool reads as ~0
 void RecordRelease(CofferVal val);
 void RecordMpRelease(MemPool *pool, CofferVal val);
 

@@ -1,9 +1,9 @@
 // SPDX-License-Identifier: MIT
 // The pools and the region heap: the model, damaged regions, the pools'
-// reports, handle conventions, processes sharing a region. The program has
-// its own heap, with a point after every header write where a process can be
-// killed; its own lock calls, through which the model sees the shared pool
-// lock; and its own Panic, which leaves the report where a parent reads it.
+// reports, processes sharing a region. The program has its own heap, with a
+// point after every header write where a process can be killed; its own lock
+// calls, through which the model sees the shared pool lock; and its own
+// Panic, which leaves the report where a parent reads it.
 #include <dlfcn.h>
 #include <gtest/gtest.h>
 #include <signal.h>
@@ -163,27 +163,6 @@ TEST(PoolsDeathTest, Reports) {
   };
   for (const auto &[call, report] : rows) EXPECT_DEATH(call(), report);
   g_onAcquire = g_onRelease = nullptr;
-}
-
-// At most one release callback is set, and a dropped value (0 included)
-// goes to it, the pool kind with the handle as the pool; a handle made by a
-// family is released through its pool.
-TEST(Pools, HandleConventions) {
-  TestPool tp;
-  CollectionHeader *h = coffer::AllocHandle(tp.pool());
-  h->freeValFn = RecordRelease;
-  Releases().clear();
-  EXPECT_EQ(coffer::SetMpFreeValFn(h, RecordMpRelease), nullptr);  // not the cleared one
-  EXPECT_EQ(h->freeValFn, nullptr);
-  coffer::DropValue(h, 0);
-  EXPECT_EQ(coffer::SetFreeValFn(h, RecordRelease), nullptr);
-  EXPECT_EQ(h->mpFreeValFn, nullptr);
-  coffer::DropValue(h, 7);
-  EXPECT_EQ(coffer::SetFreeValFn(h, nullptr), RecordRelease);
-  coffer::DropValue(h, 9);  // nobody to tell
-  EXPECT_EQ(Releases(), (std::vector<Released>{{0, &h->mp}, {7, nullptr}}));
-  coffer::ReleaseHandle(h);
-  EXPECT_TRUE(tp.held() == 0 && tp.misuse.empty());
 }
 
 constexpr uint32_t kRegion = 1 << 21, kKillRegion = 2048, kBlocks = 10;
