@@ -31,7 +31,9 @@ namespace {
 using coffer::hst::Children;
 using coffer::hst::CopyPath;
 using coffer::hst::Data;
+using coffer::hst::FindChildIn;
 using coffer::hst::FindCut;
+using coffer::hst::InsertChild;
 using coffer::hst::IsLastName;
 using coffer::hst::NodeAt;
 
@@ -59,13 +61,14 @@ HstNode *FindRep(HstaaTree *tree, HstNode *node, const char *key) {
 HstNode *InsertStep(HstaaTree *tree, HstNode *node, const char *key, bool *plain) {
   HstTree *h = &tree->hst;
   *plain = false;
-  if (HstNode *child = HST_FindChild(h, node, key)) return child;
+  int32_t slot;  // one search: where a plain child goes when there is none
+  if (HstNode *child = FindChildIn(h, node, key, &slot)) return child;
   if (HstNode *rep = FindRep(tree, node, key)) {
     HstNode *copy = HST_CloneSubtree(h, rep, tree->cloneValFn, key, node);
     if (copy) HSTAAAdjustSubtreeValCount(h, node, copy->subtreeValCount);
     return copy;
   }
-  HstNode *child = HST_InsertChild(h, node, key, Data(h)->defaultVal);
+  HstNode *child = InsertChild(h, node, key, Data(h)->defaultVal, slot);
   *plain = child != nullptr;
   return child;
 }
