@@ -56,14 +56,14 @@ struct Walk {
   bool Step() {
     Frame &f = stack[depth - 1];
     const HstNode *node = NodeAt(tree, f.node);
-    EsaArray kids = Children(tree, const_cast<HstNode *>(node));
-    if (f.next == coffer::Data(&kids)->size) {
+    const EsaArrayData *kids = ChildArray(tree, node);
+    if (f.next == kids->size) {
       depth--;
       if (counts && node->subtreeValCount < f.below)
         return Fault(fault, "value count below its children's", f.node);
       return true;
     }
-    const EsaEntry *entry = EntriesOf(&kids) + f.next++;
+    const EsaEntry *entry = EntriesOf(tree, kids) + f.next++;
     const PoolOffset off = static_cast<PoolOffset>(entry->val);
     if (!off) return Fault(fault, "child entry names no node", f.node);
     if (!SpanHolds(span, off, sizeof(HstNode))) return Fault(fault, "node outside the region", f.node);
@@ -71,7 +71,7 @@ struct Walk {
     if (child->parent != f.node) return Fault(fault, "parent link disagrees with child entry", f.node);
     if (child->key == 0) return Fault(fault, "node without a name", off);
     if (!SpanHoldsString(span, &tree->mp, child->key)) return Fault(fault, "key outside the region", off);
-    if (std::strcmp(KeyOf(&kids, entry), RecordAt<const char>(tree, child->key)) != 0)
+    if (std::strcmp(KeyOf(tree, entry), RecordAt<const char>(tree, child->key)) != 0)
       return Fault(fault, "child entry named unlike its node", off);
     f.below += child->subtreeValCount;
     return Enter(off);
