@@ -26,32 +26,33 @@ namespace {
 
 constexpr uint32_t kHead = sizeof(ShBlockHeader);
 
-// The capacity of the allocated block whose payload starts at payload, found
-// by walking the tiling from the first block; 0 when no allocated block
-// starts there. Each step moves at least a header forward, so the walk ends.
-uint32_t AllocatedCapacity(RegionView v, uint32_t payload) {
-  const uint32_t target = payload - kHead;
+// Whether a block starts at off, found by walking the tiling from the first
+// block. Each step moves at least a header forward, so the walk ends.
+bool Reaches(RegionView v, uint32_t off) {
   uint32_t o = kHead;
-  while (o < target) {
-    if (!v.Holds(o, kHead)) return 0;
+  while (o < off) {
+    if (!v.Holds(o, kHead)) return false;
     const uint32_t size = v.At<ShBlockHeader>(o)->blockSize;
-    if (size < kHead || size % 4 != 0 || size > v.limit - o) return 0;
+    if (size < kHead || size % 4 != 0 || size > v.limit - o) return false;
     o += size;
   }
-  if (o != target || !v.Holds(o, kHead)) return 0;
-  const ShBlockHeader *b = v.At<ShBlockHeader>(o);
-  if (b->nextFree != 0 || b->prevFree != 0 || b->blockSize < kHead || b->blockSize > v.limit - o)
-    return 0;
-  return b->blockSize - kHead;
+  return o == off;
 }
 
-// The same judged from the block's own header only, for records the
-// directory names: constant time, no walk.
+// The payload at payload is that of a block marked allocated with room for
+// bytes, judged from the block's own header only: constant time, no walk,
+// for the records the directory names.
 bool LooksAllocated(RegionView v, uint32_t payload, uint32_t bytes) {
   if (payload < 2 * kHead || !v.Holds(payload - kHead, kHead + uint64_t{bytes})) return false;
   const ShBlockHeader *b = v.At<ShBlockHeader>(payload - kHead);
   return b->nextFree == 0 && b->prevFree == 0 && b->blockSize >= kHead + bytes &&
          b->blockSize <= v.limit - (payload - kHead);
+}
+
+// The same, and the tiling reaches the block, so its header is no stale
+// word inside another block's payload: for the directory and its entries.
+bool IsAllocated(RegionView v, uint32_t payload, uint32_t bytes) {
+  return LooksAllocated(v, payload, bytes) && Reaches(v, payload - kHead);
 }
 
 bool EntryNameSound(const RootsEntry &e) {
@@ -67,15 +68,6 @@ const char *EntriesFault(RegionView v, const RootsDirectory *dir) {
     if (!v.Holds(e[i].record, 4)) return "a root's record lies outside the region";
   }
   return nullptr;
-}
-
-// A handle around a record of the view, for the family checkers' helpers.
-CollectionHeader HandleAt(RegionView v, PoolOffset off) {
-  CollectionHeader h;
-  std::memset(&h, 0, sizeof h);
-  h.mp.base = const_cast<char *>(v.base);
-  h.data = const_cast<RootsDirectory *>(v.At<RootsDirectory>(off));
-  return h;
 }
 
 const char *ArrayFault(RegionView v, PoolOffset off) {
@@ -116,20 +108,28 @@ const char *DirectoryFault(RegionView v, const RootsDirectory **out, bool *stale
   const PoolOffset off = v.At<ShRegionHeader>(0)->reserved[1];
   const RootsDirectory *dir = v.At<RootsDirectory>(off);
   if (!v.Holds(off, sizeof *dir)) return "directory outside the region";
-  if (AllocatedCapacity(v, off) < sizeof *dir)
+  if (!IsAllocated(v, off, sizeof *dir))
     return "directory not in an allocated block (left from before a format?)";
   if (dir->magic != ROOTS_DIRECTORY_MAGIC || dir->self != off) return "no directory record there";
   *stale = false;
   const uint64_t bytes = uint64_t{sizeof(RootsEntry)} * static_cast<uint32_t>(dir->capacity);
   if (dir->count < 0 || dir->count > dir->capacity || (dir->capacity > 0 && !v.Holds(dir->entries, bytes)))
     return "directory sizes damaged";
-  if (dir->capacity > 0 && AllocatedCapacity(v, dir->entries) < bytes)
+  if (dir->capacity > 0 && !IsAllocated(v, dir->entries, static_cast<uint32_t>(bytes)))
     return "directory entries not in an allocated block";
   *out = dir;
   return EntriesFault(v, dir);
 }
 
 }  // namespace
+
+CollectionHeader HandleAt(RegionView v, PoolOffset off) {
+  CollectionHeader h;
+  std::memset(&h, 0, sizeof h);
+  h.mp.base = const_cast<char *>(v.base);
+  h.data = const_cast<char *>(v.At<char>(off));
+  return h;
+}
 
 RegionView ViewOfPool(const MemPool *pool) {
   const auto *h = static_cast<const ShRegionHeader *>(pool->base);

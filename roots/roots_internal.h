@@ -23,12 +23,13 @@ struct RegionView {
   const T *At(uint32_t off) const {
     return reinterpret_cast<const T *>(reinterpret_cast<uintptr_t>(base) + off);
   }
-  // bytes at off lie inside the region, past its header, 4-byte aligned.
-  bool Holds(uint32_t off, uint64_t bytes) const {
-    return off >= sizeof(ShRegionHeader) && off % 4 == 0 && off <= limit && bytes <= limit - off;
-  }
   // The pool offsets a container checker may follow in this region.
   CheckSpan Span() const { return CheckSpan{sizeof(ShRegionHeader), limit}; }
+  // bytes at off lie inside the region, past its header, 4-byte aligned.
+  bool Holds(uint32_t off, uint64_t bytes) const {
+    const CheckSpan span = Span();
+    return SpanHolds(&span, off, bytes);
+  }
 };
 
 // The region of a pool, trusted to be mapped as large as its header says;
@@ -36,6 +37,8 @@ struct RegionView {
 RegionView ViewOfPool(const MemPool *pool);
 // A region image of which mapped bytes are readable.
 RegionView ViewOfImage(const void *image, size_t mapped);
+// A handle around the record at off, for the family checkers and walks.
+CollectionHeader HandleAt(RegionView v, PoolOffset off);
 
 // The region's directory, or null with the reason there is none that can be
 // trusted (see roots.h for what is checked), and whether the words only lead

@@ -38,7 +38,7 @@ archive() {
 archive library platform/*.cpp mempool/*.cpp esa/*.cpp rbt/*.cpp hst/*.cpp hstaa/*.cpp roots/*.cpp
 archive support tests/support/*.cpp
 # coffer-inspect's reader: every command on a region image, without main.
-archive reader tools/inspect/inspect.cpp tools/inspect/heap_view.cpp
+archive reader tools/inspect/inspect.cpp
 
 for src in tests/fuzz/*_fuzz.cpp; do
   name=$(basename "$src" .cpp)

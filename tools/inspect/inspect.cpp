@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: MIT
-// coffer-inspect's commands on a region image. Each reads only what a
-// checker has vouched for: the heap checker for blocks, the directory's
-// checks for roots, the family's checker (with the region as its span) for a
-// container before it is dumped.
+// coffer-inspect's commands on a region image. check and stats walk the
+// blocks with the region heap's own checker; roots and dump read only what
+// the directory's checks and a record's allocation test have vouched for,
+// and dump runs the family's checker (with the region as its span) on a
+// container before it reads any more of it.
 #include "tools/inspect/inspect.h"
 
 #include <cstdlib>
@@ -11,8 +12,8 @@
 #include "esa/esa_internal.h"
 #include "hst/hst_internal.h"
 #include "rbt/rbt_internal.h"
+#include "mempool/region_heap.h"
 #include "roots/roots_internal.h"
-#include "tools/inspect/heap_view.h"
 
 namespace inspect {
 namespace {
@@ -32,7 +33,7 @@ struct Writer {
   void Sep(const char *key) {
     if (depth > 0 && comma[depth]) std::fputc(',', f);
     if (depth > 0) comma[depth] = true;
-    if (key) Quoted(key, std::strlen(key)), std::fputc(':', f);
+    if (key) Quoted(key), std::fputc(':', f);
   }
   void Begin(const char *key, char open) {
     Sep(key);
@@ -46,7 +47,8 @@ struct Writer {
   void U(const char *key, uint64_t v) { Sep(key), std::fprintf(f, "%llu", static_cast<unsigned long long>(v)); }
   void I(const char *key, int64_t v) { Sep(key), std::fprintf(f, "%lld", static_cast<long long>(v)); }
   void B(const char *key, bool v) { Sep(key), std::fputs(v ? "true" : "false", f); }
-  void S(const char *key, const char *s) { Sep(key), Quoted(s, std::strlen(s)); }
+  void S(const char *key, const char *s) { Sep(key), Quoted(s); }
+  int Quoted(const char *s) { return Quoted(s, std::strlen(s)); }
   // Returns the number of characters written.
   int Quoted(const char *s, size_t n) {
     int written = 2;
@@ -75,19 +77,11 @@ struct Ctx {
   Writer w;
 };
 
-CollectionHeader HandleAt(const Ctx &c, PoolOffset off) {
-  CollectionHeader h;
-  std::memset(&h, 0, sizeof h);
-  h.mp.base = const_cast<void *>(c.image);
-  h.data = const_cast<char *>(c.view.At<char>(off));
-  return h;
-}
-
 // The family checker of kind on the record at off, within the region; null
 // and fault filled when it finds damage.
 bool ContainerSound(const Ctx &c, uint32_t kind, PoolOffset off, coffer::CheckFault *fault) {
   if (const char *why = coffer::RootsRecordFault(c.view, kind, off)) return *fault = {why, off}, false;
-  CollectionHeader h = HandleAt(c, off);
+  CollectionHeader h = coffer::HandleAt(c.view, off);
   const coffer::CheckSpan span = c.view.Span();
   switch (kind) {
     case ROOTS_KIND_ARRAY: return coffer::ESACheckArray(&h, fault, &span);
@@ -102,10 +96,6 @@ int64_t SizeOf(const Ctx &c, uint32_t kind, PoolOffset off) {
   if (kind == ROOTS_KIND_ARRAY) return c.view.At<EsaArrayData>(off)->size;
   if (kind == ROOTS_KIND_HST) return c.view.At<HstTreeData>(off)->size;
   return c.view.At<RbtTreeData>(off)->size;
-}
-
-const RootsDirectory *Directory(const Ctx &c, const char **why, bool *stale) {
-  return coffer::RootsFindDirectory(c.view, why, stale);
 }
 
 // ---- check ----------------------------------------------------------------------
@@ -125,25 +115,25 @@ struct Problems {
       return w.End('}');
     }
     std::fprintf(w.f, "%s", where);
-    if (name) std::fputc(' ', w.f), w.Quoted(name, std::strlen(name));
+    if (name) std::fputc(' ', w.f), w.Quoted(name);
     std::fprintf(w.f, ": %s at %u: %s\n", isDamage ? "damage" : "note", at, what);
   }
 };
 
-void HeapFindingTo(void *context, const HeapFinding &f) {
-  static_cast<Problems *>(context)->Add("heap", nullptr, f.at, f.what, f.damage);
+void HeapFaultTo(void *context, coffer::ShFault fault, uint32_t at) {
+  static_cast<Problems *>(context)->Add("heap", nullptr, at, coffer::SHFaultText(fault), coffer::SHFaultIsDamage(fault));
 }
 
 void CheckDirectory(Ctx &c, Problems &p) {
   const char *why;
   bool stale;
-  const RootsDirectory *dir = Directory(c, &why, &stale);
-  const uint32_t at = c.view.limit >= 16 ? c.view.At<ShRegionHeader>(0)->reserved[1] : 0;
+  const RootsDirectory *dir = coffer::RootsFindDirectory(c.view, &why, &stale);
   if (!dir) {
     // A region without the magic has no directory; one whose words lead to
     // no allocated block holds words from before a format, which is no damage.
-    if (c.view.limit >= 16 && c.view.At<ShRegionHeader>(0)->reserved[0] == ROOTS_REGION_MAGIC)
-      p.Add("directory", nullptr, at, why, !stale);
+    const ShRegionHeader *header = c.view.At<ShRegionHeader>(0);
+    if (c.view.limit >= sizeof *header && header->reserved[0] == ROOTS_REGION_MAGIC)
+      p.Add("directory", nullptr, header->reserved[1], why, !stale);
     return;
   }
   const RootsEntry *e = coffer::RootsEntries(c.view, dir);
@@ -157,8 +147,8 @@ int Check(Ctx &c) {
   Writer &w = c.w;
   Problems p{&c};
   if (w.json) w.Begin(nullptr, '{'), w.S("command", "check"), w.U("regionSize", c.view.limit), w.Begin("problems", '[');
-  const HeapState state = CheckHeap(c.image, c.size, nullptr, HeapFindingTo, &p);
-  if (state == kHeapNoMemory) p.Add("heap", nullptr, 0, "out of memory: the heap was not checked", true);
+  const coffer::ShHeapState state = coffer::SHCheckRegion(c.image, c.size, nullptr, HeapFaultTo, &p);
+  if (state == coffer::ShHeapState::kNoMemory) p.Add("heap", nullptr, 0, "out of memory: the heap was not checked", true);
   CheckDirectory(c, p);
   if (w.json) {
     w.End(']');
@@ -176,19 +166,20 @@ int Check(Ctx &c) {
 // ---- stats ------------------------------------------------------------------------
 
 struct FirstDamage {
-  HeapFinding first;
+  coffer::ShFault fault;
+  uint32_t at;
   bool seen;
 };
-void KeepFirstDamage(void *context, const HeapFinding &f) {
+void KeepFirstDamage(void *context, coffer::ShFault fault, uint32_t at) {
   auto *k = static_cast<FirstDamage *>(context);
-  if (f.damage && !k->seen) k->first = f, k->seen = true;
+  if (coffer::SHFaultIsDamage(fault) && !k->seen) *k = {fault, at, true};
 }
 
 int Stats(Ctx &c) {
-  HeapStats s;
-  FirstDamage d = {{nullptr, 0, false}, false};
-  const HeapState state = CheckHeap(c.image, c.size, &s, KeepFirstDamage, &d);
-  if (state == kHeapNoMemory) return Refuse(c.w.json, c.w.f, "out of memory: the heap was not walked");
+  coffer::ShHeapCounts s;
+  FirstDamage d = {};
+  const coffer::ShHeapState state = coffer::SHCheckRegion(c.image, c.size, &s, KeepFirstDamage, &d);
+  if (state == coffer::ShHeapState::kNoMemory) return Refuse(c.w.json, c.w.f, "out of memory: the heap was not walked");
   // Fragmentation: the share of free bytes outside the largest free block.
   const double frag = s.freeBytes ? 1.0 - static_cast<double>(s.largestFree) / s.freeBytes : 0.0;
   Writer &w = c.w;
@@ -203,7 +194,7 @@ int Stats(Ctx &c) {
       if (s.sizeLog2[b]) w.Begin(nullptr, '{'), w.U("from", 1ull << b), w.U("to", (2ull << b) - 1), w.U("blocks", s.sizeLog2[b]), w.End('}');
     w.End(']');
     w.B("intact", !d.seen);
-    if (d.seen) w.U("damageAt", d.first.at), w.S("damage", d.first.what);
+    if (d.seen) w.U("damageAt", d.at), w.S("damage", coffer::SHFaultText(d.fault));
     w.End('}');
   } else {
     std::fprintf(w.f, "region size         %u bytes\n", c.view.limit);
@@ -215,7 +206,7 @@ int Stats(Ctx &c) {
     std::fprintf(w.f, "block sizes (bytes, headers included):\n");
     for (int b = 0; b < 32; b++)
       if (s.sizeLog2[b]) std::fprintf(w.f, "  %10llu .. %-10llu %u\n", 1ull << b, (2ull << b) - 1, s.sizeLog2[b]);
-    if (d.seen) std::fprintf(w.f, "damaged at %u: %s (run check for every problem)\n", d.first.at, d.first.what);
+    if (d.seen) std::fprintf(w.f, "damaged at %u: %s (run check for every problem)\n", d.at, coffer::SHFaultText(d.fault));
   }
   return d.seen ? 1 : 0;
 }
@@ -224,7 +215,7 @@ int Stats(Ctx &c) {
 
 int Roots(Ctx &c) {
   const char *why;
-  const RootsDirectory *dir = Directory(c, &why, nullptr);
+  const RootsDirectory *dir = coffer::RootsFindDirectory(c.view, &why);
   if (!dir) return Refuse(c.w.json, c.w.f, why);
   Writer &w = c.w;
   if (w.json) w.Begin(nullptr, '{'), w.S("command", "roots"), w.Begin("roots", '[');
@@ -239,7 +230,7 @@ int Roots(Ctx &c) {
       w.End('}');
       continue;
     }
-    const int width = w.Quoted(e[i].name, std::strlen(e[i].name));
+    const int width = w.Quoted(e[i].name);
     std::fprintf(w.f, "%*s %-11s %10u  ", width < 24 ? 24 - width : 0, "", kind, e[i].record);
     if (fault)
       std::fprintf(w.f, "damaged: %s\n", fault);
@@ -271,7 +262,7 @@ void DumpArray(Ctx &c, PoolOffset off) {
       w.Begin(nullptr, '{'), w.S("key", Str(c, e[i].key)), Value(w, e[i].val), w.End('}');
       continue;
     }
-    w.Quoted(Str(c, e[i].key), std::strlen(Str(c, e[i].key)));
+    w.Quoted(Str(c, e[i].key));
     std::fputs(" = ", w.f), Value(w, e[i].val), std::fputc('\n', w.f);
   }
   if (w.json) w.End(']');
@@ -281,7 +272,7 @@ void TreeKey(Ctx &c, uint32_t kind, const RbtNode *n) {
   Writer &w = c.w;
   if (kind == ROOTS_KIND_RBT) {
     if (w.json) return w.S("key", Str(c, n->key));
-    w.Quoted(Str(c, n->key), std::strlen(Str(c, n->key)));
+    w.Quoted(Str(c, n->key));
     return;
   }
   if (kind == ROOTS_KIND_RBT_INT32) {
@@ -293,7 +284,7 @@ void TreeKey(Ctx &c, uint32_t kind, const RbtNode *n) {
   std::fprintf(w.f, "0x%08x", n->key);
 }
 
-// In order, with the explicit stack the checker's depth bound allows.
+// Depth first, with the explicit stack the checker's depth bound allows.
 uint32_t TreeHeight(const Ctx &c, PoolOffset off) {
   const RbtTreeData *d = c.view.At<RbtTreeData>(off);
   struct Item { PoolOffset node; uint32_t depth; } stack[72];
@@ -315,16 +306,14 @@ void DumpTree(Ctx &c, uint32_t kind, PoolOffset off) {
   const uint32_t height = TreeHeight(c, off);
   if (w.json) w.U("size", d->size), w.U("height", height), w.Begin("nodes", '[');
   else std::fprintf(w.f, "%s: %u nodes, height %u\n", coffer::RootsKindName(kind), d->size, height);
-  PoolOffset stack[72];
-  uint32_t top = 0;
-  for (PoolOffset x = d->root; x != d->nil || top;) {
-    for (; x != d->nil; x = c.view.At<RbtNode>(x)->left) stack[top++] = x;
-    const RbtNode *n = c.view.At<RbtNode>(stack[--top]);
+  // The checker has vouched for every link, so the tree's own walk may follow them.
+  CollectionHeader h = coffer::HandleAt(c.view, off);
+  const coffer::RbtCtx tree(&h);
+  for (const RbtNode *n = coffer::RBTMinimum(tree); n; n = coffer::RBTSuccessor(tree, n)) {
     if (w.json) w.Begin(nullptr, '{');
     TreeKey(c, kind, n);
     if (w.json) Value(w, n->val), w.End('}');
     else std::fputs(" = ", w.f), Value(w, n->val), std::fputc('\n', w.f);
-    x = n->right;
   }
   if (w.json) w.End(']');
 }
@@ -366,7 +355,6 @@ struct PathWalk {
   bool Run(PoolOffset root, int32_t size) {
     stack = static_cast<Frame *>(std::malloc(sizeof(Frame) * static_cast<uint32_t>(size)));
     if (!stack) return false;
-    path[0] = '\0';
     Line(c.view.At<HstNode>(root), 0, 0);
     stack[depth++] = {root, 0, 0};
     while (depth) {
@@ -379,7 +367,6 @@ struct PathWalk {
       }
       const PoolOffset child = static_cast<PoolOffset>(c.view.At<EsaEntry>(kids->entries)[f.next++].val);
       const HstNode *n = c.view.At<HstNode>(child);
-      path[f.length] = '\0';
       const uint32_t length = Append(f.length, Str(c, n->key));
       Line(n, length, depth);
       stack[depth++] = {child, 0, length};
@@ -405,12 +392,12 @@ int Dump(Ctx &c) {
   PoolOffset off = c.request.at;
   if (c.request.name) {
     const char *why;
-    const RootsDirectory *dir = Directory(c, &why, nullptr);
+    const RootsDirectory *dir = coffer::RootsFindDirectory(c.view, &why);
     int32_t at;
     if (!dir) return Refuse(c.w.json, c.w.f, why);
     if (!coffer::RootsSearch(c.view, dir, c.request.name, &at)) return Refuse(c.w.json, c.w.f, "no root of that name");
-    kind = coffer::RootsEntries(c.view, dir)[at].kind;
-    off = coffer::RootsEntries(c.view, dir)[at].record;
+    const RootsEntry &entry = coffer::RootsEntries(c.view, dir)[at];
+    kind = entry.kind, off = entry.record;
   }
   coffer::CheckFault fault;
   if (!ContainerSound(c, kind, off, &fault)) {
