@@ -65,7 +65,7 @@ TEST(Esa, CheckerFindsEachDamage) {
   RegionPool r(256);
   EsaArray *a = ESA_AllocArrayEx(&r.pool, 4, 4);
   for (const char *k : {"a", "b", "c"}) ESA_Insert(a, k, 0);
-  auto *d = static_cast<EsaArrayData *>(a->data);
+  EsaArrayData *d = coffer::Data(a);
   EsaEntry *e = ESA_Get(a, 0);
   coffer::CheckSpan span = {16, 1024};  // the region past its header
   ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::ESACheckArray(a, f, &span); },
@@ -123,7 +123,7 @@ TEST(Rbt, CheckerFindsEachDamage) {
     d->root = coffer::OffsetOf(t, n[1]);
   };
   ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::RBTCheckTree(t, coffer::kRbtInt32Keys, f, &span); },
-                  {{"sentinel changed", [&] { coffer::RecordAt<RbtNode>(t, d->nil)->color = 1; }},
+                  {{"sentinel changed", [&] { coffer::RbtCtx(t).nil->color = 1; }},
                    {"red root", [&] { node(4)->color = 1; }},
                    {"red node with a red child", [&] { node(7)->color = 1; }},
                    {"black heights differ", [&] { node(1)->color = 1 - node(1)->color; }},
@@ -180,8 +180,8 @@ TEST(Hst, CheckerFindsEachDamage) {
   HstTree *t = HST_AllocTreeEx(&r.pool, '/', 0, 2, 2);
   for (const char *p : {"/a/b", "/a/c", "/d"}) HST_Insert(t, p, 0);
   HstNode *a = HST_Find(t, "/a"), *b = HST_Find(t, "/a/b"), *root = HST_GetRoot(t);
-  auto *data = static_cast<HstTreeData *>(t->data);
-  auto *e = coffer::RecordAt<EsaEntry>(t, coffer::RecordAt<EsaArrayData>(t, a->children)->entries);
+  HstTreeData *data = coffer::hst::Data(t);
+  EsaEntry *e = coffer::EntriesOf(t, coffer::hst::ChildArray(t, a));
   coffer::CheckSpan span = {16, 4096};  // the region past its header
   ExpectEachFound(r.words, [&](coffer::CheckFault *f) { return coffer::hst::HSTCheckTree(t, true, f, &span); },
                   {{"root missing, named or with a parent", [&] { root->parent = a->parent; }},

@@ -62,11 +62,11 @@ std::string RunEsaModel(Ops &ops, Arena arena) {
   EsaArray *a = ESA_AllocArrayEx(arena.pool, m.cap, m.inc);
   if (!a) return made.Refused() || m.cap < 0 || m.cap == 0x20000000 ? "" : "creation failed unrefused";
   MODEL_EXPECT(m.cap >= 0 && m.cap < 0x20000000);
-  const bool mp = ops.Take(2);  // either kind of release callback: setting one clears the other
-  MODEL_EXPECT(mp ? !ESA_SetMpFreeValFn(a, RecordMpRelease) && !ESA_SetFreeValFn(a, RecordRelease) &&
-                        !ESA_SetMpFreeValFn(a, RecordMpRelease)
-                  : !ESA_SetFreeValFn(a, RecordRelease) && !ESA_SetMpFreeValFn(a, RecordMpRelease) &&
-                        !ESA_SetFreeValFn(a, RecordRelease));
+  // Either kind of release callback, each set after the other, which it
+  // clears: so each setter finds none of its own kind set before it.
+  auto set = [a](bool mp) { return mp ? !ESA_SetMpFreeValFn(a, RecordMpRelease) : !ESA_SetFreeValFn(a, RecordRelease); };
+  const bool mp = ops.Take(2);
+  MODEL_EXPECT(set(mp) && set(!mp) && set(mp));
   const MemPool *pool = mp ? &a->mp : nullptr;  // what the callback gets, the handle's pool copy
   for (CofferVal next = 0; ops.More(); next++) {  // 0 is a value like any other
     Releases().clear();

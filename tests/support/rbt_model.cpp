@@ -197,7 +197,7 @@ std::string Run(Ops &ops, Arena arena) {
       // caller's sentinel is released nor the tree's own left behind
       RbtNode *lend = ops.Take(2) ? (lent == &nils[0] ? &nils[1] : &nils[0]) : nullptr;
       RbtTree *other = lend ? F::allocWithNil(arena.pool, lend) : F::allocEx(arena.pool);
-      if (!other) MODEL_EXPECT(op.Refused());
+      MODEL_EXPECT(other || op.Refused());
       if (!other) continue;
       F::setFreeValFn(other, Release<F>);  // callbacks stay with their handles
       F::swap(t, other);
@@ -205,7 +205,6 @@ std::string Run(Ops &ops, Arena arena) {
       F::freeTree(t);
       g_tree<F> = t = other;
     } else if (kind == 14) {
-      dropped.clear();
       for (const auto &x : m) dropped.push_back(x.val);
       F::clear(t);
       m.clear();

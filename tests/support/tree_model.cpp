@@ -395,9 +395,7 @@ std::string RunHstaaModel(Ops &ops, Arena arena) {
       if (op.Refused()) {  // (a refusal inside an element does not stop the insertion)
         coffer::CheckFault fault;
         MODEL_EXPECT(coffer::hst::HSTCheckTree(t, true, &fault));
-        auto adopted = m.Adopt(t, HST_GetRoot(t));
-        m.root.kids = std::move(adopted->kids);
-        m.root.val = adopted->val, m.root.held = adopted->held;
+        m.root = std::move(*m.Adopt(t, HST_GetRoot(t)));
         for (auto &k : m.root.kids) k.second->parent = &m.root;
         want = g_log, got = nullptr, mine = nullptr;
       }
