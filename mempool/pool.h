@@ -16,13 +16,17 @@ namespace coffer {
 // The sums wrap in 32 bits, so they are formed on integers, not pointers.
 // The linked forms skip the test for 0 and null: they serve offsets that are
 // never 0 and addresses that are never null (see LinkedRecordAt below).
-inline void *LinkedAddr(const MemPool *mp, PoolOffset off) {
-  return reinterpret_cast<void *>(reinterpret_cast<uintptr_t>(mp->base) + off);
+// Either takes the base itself, for a caller that keeps it at hand, or the
+// pool whose base it is.
+inline void *LinkedAddr(const void *base, PoolOffset off) {
+  return reinterpret_cast<void *>(reinterpret_cast<uintptr_t>(base) + off);
 }
-inline PoolOffset LinkedOffset(const MemPool *mp, const void *p) {
+inline PoolOffset LinkedOffset(const void *base, const void *p) {
   return static_cast<PoolOffset>(reinterpret_cast<uintptr_t>(p) -
-                                 reinterpret_cast<uintptr_t>(mp->base));
+                                 reinterpret_cast<uintptr_t>(base));
 }
+inline void *LinkedAddr(const MemPool *mp, PoolOffset off) { return LinkedAddr(mp->base, off); }
+inline PoolOffset LinkedOffset(const MemPool *mp, const void *p) { return LinkedOffset(mp->base, p); }
 inline void *OffsetToAddr(const MemPool *mp, PoolOffset off) {
   return off ? LinkedAddr(mp, off) : nullptr;
 }
@@ -62,15 +66,12 @@ inline PoolOffset OffsetOf(const CollectionHeader *h, const void *p) {
 }
 
 // The same idiom for offsets that are never 0 and records that are never
-// null: the links inside a red-black tree, where an absent node is the
-// tree's sentinel, and the key copies its nodes name. They skip the null
-// test, which would otherwise cost a branch at every step of every descent.
+// null: the key copies a red-black tree's nodes name (its links convert in
+// RbtCtx, from the base it keeps). It skips the null test, which would
+// otherwise cost a branch at every step of every descent.
 template <class T>
 inline T *LinkedRecordAt(const CollectionHeader *h, PoolOffset off) {
   return static_cast<T *>(LinkedAddr(&h->mp, off));
-}
-inline PoolOffset LinkedOffsetOf(const CollectionHeader *h, const void *p) {
-  return LinkedOffset(&h->mp, p);
 }
 
 // Every allocation of a container goes through its handle's pool copy, with

@@ -164,7 +164,7 @@ void DeleteFixup(const RbtCtx &c, PoolOffset xo) {
 
 }  // namespace
 
-void RBTAttach(const RbtCtx &c, RbtNode *z, RbtNode *parent, bool left) {
+void RBTAttach(RbtCtx c, RbtNode *z, RbtNode *parent, bool left) {
   PoolOffset zo = c.OffsetOf(z);
   z->parent = c.OffsetOf(parent);
   if (parent == c.nil)
@@ -177,7 +177,7 @@ void RBTAttach(const RbtCtx &c, RbtNode *z, RbtNode *parent, bool left) {
   c.d->size++;
 }
 
-void RBTUnlink(const RbtCtx &c, RbtNode *z) {
+void RBTUnlink(RbtCtx c, RbtNode *z) {
   PoolOffset zo = c.OffsetOf(z);
   RbtNode *y = (z->left == c.nilOff || z->right == c.nilOff) ? z : RBTSuccessor(c, z);
   PoolOffset yo = c.OffsetOf(y);

@@ -77,7 +77,7 @@ RbtNode *InsertNode(RbtTree *tree, RbtNode *node, typename K::Arg key, CofferVal
 }
 
 template <class K>
-void RemoveNode(const RbtCtx &c, RbtNode *z) {
+void RemoveNode(RbtCtx c, RbtNode *z) {
   // The value goes first, while z is still linked and counted.
   DropValue(c.t, z->val);
   RBTUnlink(c, z);

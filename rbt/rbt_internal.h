@@ -17,22 +17,35 @@ namespace coffer {
 
 enum : uint8_t { kRbtBlack = 0, kRbtRed = 1 };
 
-// One call's view of a tree: the data record and the sentinel, resolved once.
-// Links inside the tree are never 0 (an absent child is the sentinel), so
-// they convert without a null test, and loops test them against nilOff
-// before converting, so a walk converts only the nodes it actually visits.
+// One call's view of a tree: the data record, the sentinel and the pool's
+// base, resolved once. Links inside the tree are never 0 (an absent child is
+// the sentinel), so they convert without a null test, and loops test them
+// against nilOff before converting, so a walk converts only the nodes it
+// actually visits.
+//
+// The balancing procedures take the view by value. A colour is a byte, and
+// a store to a byte may change any memory the compiler cannot rule out, so
+// a view read through a reference (or the handle's base read through the
+// handle) would be loaded again after every recolouring, in the middle of
+// the fix-up's chain of dependent loads. A copy of its own, whose address
+// never leaves the call, stays in registers.
 struct RbtCtx {
   RbtTree *t;
   RbtTreeData *d;
+  const void *base;
   PoolOffset nilOff;
   RbtNode *nil;
 
   explicit RbtCtx(RbtTree *tree)
-      : t(tree), d(static_cast<RbtTreeData *>(tree->data)), nilOff(d->nil), nil(NodeAt(nilOff)) {}
+      : t(tree),
+        d(static_cast<RbtTreeData *>(tree->data)),
+        base(tree->mp.base),
+        nilOff(d->nil),
+        nil(NodeAt(nilOff)) {}
 
   // The tree's one place where offsets and nodes meet.
-  RbtNode *NodeAt(PoolOffset off) const { return LinkedRecordAt<RbtNode>(t, off); }
-  PoolOffset OffsetOf(const RbtNode *n) const { return LinkedOffsetOf(t, n); }
+  RbtNode *NodeAt(PoolOffset off) const { return static_cast<RbtNode *>(LinkedAddr(base, off)); }
+  PoolOffset OffsetOf(const RbtNode *n) const { return LinkedOffset(base, n); }
 };
 
 // Each walk and balancing case has a mirror image; both are written once, for
@@ -116,12 +129,12 @@ inline RbtNode *RBTMaximum(const RbtCtx &c) {
 
 // Links a filled red node z below parent (the sentinel for an empty tree) on
 // the given side, rebalances and counts it.
-void RBTAttach(const RbtCtx &c, RbtNode *z, RbtNode *parent, bool left);
+void RBTAttach(RbtCtx c, RbtNode *z, RbtNode *parent, bool left);
 
 // Takes z out of the tree and rebalances; when z has two children its
 // successor node is relinked into z's place. Touches neither z's key nor its
 // value, releases nothing and leaves size alone.
-void RBTUnlink(const RbtCtx &c, RbtNode *z);
+void RBTUnlink(RbtCtx c, RbtNode *z);
 
 // The key order a tree's checker applies: the family's own.
 enum RbtKeyKind { kRbtStringKeys, kRbtInt32Keys, kRbtVoidPtrKeys };
