@@ -94,14 +94,6 @@ struct Heap {
   bool HasSuccessor(uint32_t off) const { return at(off)->blockSize < size - off; }
 };
 
-// A free block's links are SH_NO_BLOCK or offsets of at least 16, never 0;
-// an allocated block's are both 0. One 0 link is torn.
-enum class Use { kAllocated, kFree, kTorn };
-Use UseOf(const ShBlockHeader *b) {
-  if (b->nextFree == 0 && b->prevFree == 0) return Use::kAllocated;
-  return b->nextFree != 0 && b->prevFree != 0 ? Use::kFree : Use::kTorn;
-}
-
 bool Open(Heap *h, void *region, ShOutcome *out) {
   *out = {ShRefusal::kNone, 0};
   *h = {static_cast<char *>(region), static_cast<ShRegionHeader *>(region)->regionSize, out,
@@ -120,7 +112,7 @@ bool ListStep(const Heap &h, uint32_t from, uint32_t off) {
   if (!h.Fits(off)) return h.Damaged(holder);
   const ShBlockHeader *b = h.at(off);
   if (b->prevFree == from && b->nextFree != 0 && h.SizeFits(off, b->blockSize)) return true;
-  return h.Damaged(UseOf(b) == Use::kAllocated ? holder : off);
+  return h.Damaged(SHBlockUseOf(b) == ShBlockUse::kAllocated ? holder : off);
 }
 
 // The free block at off can be unlinked: both its list neighbours (or
@@ -129,10 +121,10 @@ bool Unlinkable(const Heap &h, uint32_t off) {
   const ShBlockHeader *b = h.at(off);
   bool prevOk = b->prevFree == kNone ? h.head()->freeHead == off
                                      : h.Fits(b->prevFree) && h.at(b->prevFree)->nextFree == off &&
-                                           UseOf(h.at(b->prevFree)) == Use::kFree;
+                                           SHBlockUseOf(h.at(b->prevFree)) == ShBlockUse::kFree;
   bool nextOk =
       b->nextFree == kNone || (h.Fits(b->nextFree) && h.at(b->nextFree)->prevFree == off &&
-                               UseOf(h.at(b->nextFree)) == Use::kFree);
+                               SHBlockUseOf(h.at(b->nextFree)) == ShBlockUse::kFree);
   return (prevOk && nextOk) || h.Damaged(off);
 }
 
@@ -153,7 +145,7 @@ bool FindFit(const Heap &h, uint32_t r, uint32_t *chosen, bool *nextChecked) {
     if (!h.Fits(o)) return h.Damaged(from == kNone ? 0 : from);
     const ShBlockHeader *b = h.at(o);
     if (b->prevFree != from || --budget == 0)
-      return h.Damaged(UseOf(b) == Use::kAllocated && from != kNone ? from : o);
+      return h.Damaged(SHBlockUseOf(b) == ShBlockUse::kAllocated && from != kNone ? from : o);
     if (r > b->blockSize - kHead) continue;
     if (*chosen == kNone) {
       *chosen = o;
@@ -172,9 +164,10 @@ bool Owned(const Heap &h, void *ptr, uint32_t *off) {
   *off = payload - kHead;
   if (!h.Fits(*off)) return h.Refuse(ShRefusal::kNotAllocated, payload);
   const ShBlockHeader *b = h.at(*off);
-  Use use = UseOf(b);
-  if (use == Use::kFree) return h.Refuse(ShRefusal::kNotAllocated, payload);  // a second free
-  return (use == Use::kAllocated && h.SizeFits(*off, b->blockSize)) || h.Damaged(*off);
+  ShBlockUse use = SHBlockUseOf(b);
+  // Free already: a second release.
+  if (use == ShBlockUse::kFree) return h.Refuse(ShRefusal::kNotAllocated, payload);
+  return (use == ShBlockUse::kAllocated && h.SizeFits(*off, b->blockSize)) || h.Damaged(*off);
 }
 
 // What releasing the block at off will join: the free blocks right after it
@@ -192,9 +185,9 @@ bool CheckAfter(const Heap &h, Release *rel) {
     if (!h.Fits(next)) return h.Damaged(last);
     const ShBlockHeader *b = h.at(next);
     if (b->prevBlockSize != h.at(last)->blockSize) return h.Damaged(next);
-    Use use = UseOf(b);
-    if (use == Use::kAllocated) break;
-    if (use == Use::kTorn || !h.SizeFits(next, b->blockSize)) return h.Damaged(next);
+    ShBlockUse use = SHBlockUseOf(b);
+    if (use == ShBlockUse::kAllocated) break;
+    if (use == ShBlockUse::kTorn || !h.SizeFits(next, b->blockSize)) return h.Damaged(next);
     if (!Unlinkable(h, next)) return false;
     ++rel->after;  // offsets only grow, so this ends
   }
@@ -208,9 +201,9 @@ bool CheckBefore(const Heap &h, Release *rel) {
     if (pbs < kHead || pbs % 4 != 0 || pbs > cur - kHead || h.at(cur - pbs)->blockSize != pbs)
       return h.Damaged(cur);
     cur -= pbs;
-    Use use = UseOf(h.at(cur));
-    if (use == Use::kAllocated) return true;
-    if (use == Use::kTorn) return h.Damaged(cur);
+    ShBlockUse use = SHBlockUseOf(h.at(cur));
+    if (use == ShBlockUse::kAllocated) return true;
+    if (use == ShBlockUse::kTorn) return h.Damaged(cur);
     if (!Unlinkable(h, cur)) return false;  // offsets only shrink, so this ends
   }
 }

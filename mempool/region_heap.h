@@ -11,6 +11,15 @@
 
 namespace coffer {
 
+// A block's use, read from its free-list links alone: a free block's links
+// are SH_NO_BLOCK or offsets of at least 16, never 0; an allocated block's
+// are both 0. One 0 link is torn (damage, or a cut-short change).
+enum class ShBlockUse { kAllocated, kFree, kTorn };
+inline ShBlockUse SHBlockUseOf(const ShBlockHeader *b) {
+  if (b->nextFree == 0 && b->prevFree == 0) return ShBlockUse::kAllocated;
+  return b->nextFree != 0 && b->prevFree != 0 ? ShBlockUse::kFree : ShBlockUse::kTorn;
+}
+
 // ---- checked heap calls ----------------------------------------------------
 // A region is memory that other processes write too, so the heap checks the
 // header words it reads before it acts on them: a link before it is followed,

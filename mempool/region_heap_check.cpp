@@ -41,8 +41,8 @@ struct Walk {
   }
 };
 
-bool IsFree(const ShBlockHeader *b) { return b->nextFree != 0 && b->prevFree != 0; }
-bool IsTorn(const ShBlockHeader *b) { return (b->nextFree == 0) != (b->prevFree == 0); }
+bool IsFree(const ShBlockHeader *b) { return SHBlockUseOf(b) == ShBlockUse::kFree; }
+bool IsTorn(const ShBlockHeader *b) { return SHBlockUseOf(b) == ShBlockUse::kTorn; }
 
 void Count(ShHeapCounts *c, const ShBlockHeader *b) {
   uint32_t bs = b->blockSize;

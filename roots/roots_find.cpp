@@ -8,6 +8,7 @@
 
 #include "esa/esa_internal.h"
 #include "hst/hst_internal.h"
+#include "mempool/region_heap.h"
 #include "rbt/rbt_internal.h"
 #include "roots/roots_internal.h"
 
@@ -45,7 +46,7 @@ bool Reaches(RegionView v, uint32_t off) {
 bool LooksAllocated(RegionView v, uint32_t payload, uint32_t bytes) {
   if (payload < 2 * kHead || !v.Holds(payload - kHead, kHead + uint64_t{bytes})) return false;
   const ShBlockHeader *b = v.At<ShBlockHeader>(payload - kHead);
-  return b->nextFree == 0 && b->prevFree == 0 && b->blockSize >= kHead + bytes &&
+  return SHBlockUseOf(b) == ShBlockUse::kAllocated && b->blockSize >= kHead + bytes &&
          b->blockSize <= v.limit - (payload - kHead);
 }
 
