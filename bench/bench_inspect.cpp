@@ -41,7 +41,11 @@ void Fill(MemPool *pool, uint32_t blocks) {
   Roots_Set(pool, "array", ROOTS_KIND_ARRAY, array);
   std::mt19937 rng(7);
   std::vector<void *> fillers;
-  while (fillers.size() < blocks - 3 * n - 12) fillers.push_back(pool->alloc(pool, 16 + rng() % 1024));
+  // The containers and the directory took about 3n + 12 blocks; a small
+  // count may leave no room for fillers.
+  const uint32_t taken = 3 * n + 12;
+  const uint32_t wanted = blocks > taken ? blocks - taken : 0;
+  while (fillers.size() < wanted) fillers.push_back(pool->alloc(pool, 16 + rng() % 1024));
   for (size_t i = 0; i < fillers.size(); i += 3) pool->free(pool, fillers[i]);
 }
 
