@@ -15,9 +15,9 @@ namespace coffer {
 // both ways; nothing a pool hands out sits at its own base.
 // The sums wrap in 32 bits, so they are formed on integers, not pointers.
 // The linked forms skip the test for 0 and null: they serve offsets that are
-// never 0 and addresses that are never null (see LinkedRecordAt below).
-// Either takes the base itself, for a caller that keeps it at hand, or the
-// pool whose base it is.
+// never 0 and addresses that are never null (see LinkedRecordAt below), and
+// take either the base itself, for a caller that keeps it at hand (RbtCtx),
+// or the pool whose base it is.
 inline void *LinkedAddr(const void *base, PoolOffset off) {
   return reinterpret_cast<void *>(reinterpret_cast<uintptr_t>(base) + off);
 }
